@@ -1,0 +1,65 @@
+// Serial queues: work that runs one piece at a time, in order, on threads that all queues share.
+#pragma once
+
+#include <chrono>
+#include <functional>
+#include <memory>
+#include <string>
+
+namespace tallyd::platform {
+
+using Work = std::function<void()>;
+
+/// Something that calls a handler on its queue: a timer, or a descriptor that is ready. Destroying it cancels
+/// it.
+class Source {
+ public:
+  virtual ~Source() = default;
+
+  /// No handler starts after this returns when it is called on the source's queue; from another thread one
+  /// that is under way may still finish. The cancel handler then runs on the queue, once.
+  virtual void cancel() = 0;
+};
+
+/// Runs work one piece at a time, in the order in which it was given. Holds only what is queued, no thread.
+///
+/// Threading: every operation may be called from any thread, also from the queue's own work. The queue lives
+/// as long as anyone holds it or work is queued on it.
+class SerialQueue {
+ public:
+  virtual ~SerialQueue() = default;
+
+  [[nodiscard]] virtual const std::string& label() const = 0;
+
+  virtual void async(Work work) = 0;
+  virtual void asyncAfter(std::chrono::milliseconds delay, Work work) = 0;
+
+  /// Calls `handler` after `first` and then every `period`; ticks that come late are not made up for.
+  [[nodiscard]] virtual std::unique_ptr<Source> makeTimer(std::chrono::milliseconds first,
+                                                          std::chrono::milliseconds period, Work handler,
+                                                          Work cancelHandler = {}) = 0;
+  /// Calls `handler` while `descriptor` has something to read (or has hung up). Borrows the descriptor: it
+  /// must stay open until the source is cancelled.
+  [[nodiscard]] virtual std::unique_ptr<Source> makeReadSource(int descriptor, Work handler,
+                                                               Work cancelHandler = {}) = 0;
+  /// The same while `descriptor` can be written.
+  [[nodiscard]] virtual std::unique_ptr<Source> makeWriteSource(int descriptor, Work handler,
+                                                                Work cancelHandler = {}) = 0;
+};
+
+/// Makes queues and knows which of their work blocks.
+class Queues {
+ public:
+  /// While it lives, the calling thread is waiting for something outside the process and another thread takes
+  /// its place, so that blocked work delays nothing else.
+  class BlockingCall {
+   public:
+    virtual ~BlockingCall() = default;
+  };
+
+  virtual ~Queues() = default;
+  [[nodiscard]] virtual std::shared_ptr<SerialQueue> makeSerialQueue(std::string label) = 0;
+  [[nodiscard]] virtual std::unique_ptr<BlockingCall> blockingCall() = 0;
+};
+
+}  // namespace tallyd::platform

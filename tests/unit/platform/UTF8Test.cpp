@@ -1,0 +1,55 @@
+#include "platform/UTF8.h"
+
+#include <gtest/gtest.h>
+
+namespace tallyd::platform {
+namespace {
+
+TEST(UTF8Test, KeepsWellFormedText) {
+  for (const char* text :
+       {"", "a", "é", "€", "😀", "\xEF\xBF\xBF", "\xF4\x8F\xBF\xBF", "\xED\x9F\xBF", "\xEE\x80\x80"}) {
+    EXPECT_EQ(withBrokenUTF8Replaced(text), text);
+  }
+}
+
+TEST(UTF8Test, ReplacesEachMaximalPartOfABrokenCharacterOnce) {
+  const std::string r(kReplacementCharacter);
+  EXPECT_EQ(withBrokenUTF8Replaced("\x80"), r);
+  EXPECT_EQ(withBrokenUTF8Replaced("a\xFFz"), "a" + r + "z");
+  EXPECT_EQ(withBrokenUTF8Replaced("\xC0\x80"), r + r);
+  EXPECT_EQ(withBrokenUTF8Replaced("\xC3"), r);
+  EXPECT_EQ(withBrokenUTF8Replaced("\xC3z"), r + "z");
+  EXPECT_EQ(withBrokenUTF8Replaced("\xE2\x82"), r);
+  EXPECT_EQ(withBrokenUTF8Replaced("\xE2\x82z"), r + "z");
+  EXPECT_EQ(withBrokenUTF8Replaced("\xE0\x9F\xBF"), r + r + r);
+  EXPECT_EQ(withBrokenUTF8Replaced("\xED\xA0\x80"), r + r + r);
+  EXPECT_EQ(withBrokenUTF8Replaced("\xF0\x9F\x98"), r);
+  EXPECT_EQ(withBrokenUTF8Replaced("\xF4\x90\x80\x80"), r + r + r + r);
+  EXPECT_EQ(withBrokenUTF8Replaced("\xF5\x80"), r + r);
+}
+
+TEST(UTF8Test, AppendsEveryScalarValueAsAWellFormedCharacter) {
+  for (std::uint32_t code = 0; code <= 0x110000; code += code < 0x1000 ? 1 : 251) {
+    std::string text;
+    appendUTF8(text, code);
+    const UTF8Sequence sequence = firstUTF8Sequence(text);
+    EXPECT_TRUE(sequence.wellFormed) << code;
+    EXPECT_EQ(sequence.length, text.size()) << code;
+  }
+  std::string text;
+  appendUTF8(text, 0x1F600);
+  appendUTF8(text, 0x20AC);
+  appendUTF8(text, 0xE9);
+  EXPECT_EQ(text, "😀€é");
+}
+
+TEST(UTF8Test, AppendsTheReplacementCharacterForSurrogatesAndNumbersTooLarge) {
+  std::string text;
+  appendUTF8(text, 0xD800);
+  appendUTF8(text, 0xDFFF);
+  appendUTF8(text, 0x110000);
+  EXPECT_EQ(text, "\uFFFD\uFFFD\uFFFD");
+}
+
+}  // namespace
+}  // namespace tallyd::platform
