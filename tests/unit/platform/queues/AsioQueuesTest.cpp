@@ -1,0 +1,173 @@
+#include "platform/queues/AsioQueues.h"
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <memory>
+#include <thread>
+#include <vector>
+
+#include "Gate.h"
+#include "platform/queues/GrowingPool.h"
+
+namespace tallyd::platform {
+namespace {
+
+TEST(AsioQueuesTest, RunsWorkInTheOrderInWhichItWasGiven) {
+  AsioQueues queues(4);
+  const auto queue = queues.makeSerialQueue("test");
+  std::vector<int> order;
+  Gate done;
+  for (int i = 0; i < 1'000; ++i) queue->async([&order, i] { order.push_back(i); });
+  queue->async([&] { done.pass(); });
+  ASSERT_TRUE(done.waitFor(1));
+  ASSERT_EQ(order.size(), 1'000U);
+  for (int i = 0; i < 1'000; ++i) EXPECT_EQ(order[static_cast<std::size_t>(i)], i);
+}
+
+TEST(AsioQueuesTest, RunsOnePieceOfAQueuesWorkAtATime) {
+  AsioQueues queues(4);
+  const auto queue = queues.makeSerialQueue("test");
+  std::atomic<int> running{0};
+  std::atomic<bool> overlapped{false};
+  Gate done;
+  std::vector<std::thread> givers;
+  for (int t = 0; t < 4; ++t) {
+    givers.emplace_back([&] {
+      for (int i = 0; i < 500; ++i) {
+        queue->async([&] {
+          if (running.fetch_add(1) != 0) overlapped = true;
+          running.fetch_sub(1);
+          done.pass();
+        });
+      }
+    });
+  }
+  for (auto& giver : givers) giver.join();
+  ASSERT_TRUE(done.waitFor(2'000));
+  EXPECT_FALSE(overlapped);
+}
+
+TEST(AsioQueuesTest, QueuesWorkThatIsGivenFromTheQueueItself) {
+  AsioQueues queues(1);
+  const auto queue = queues.makeSerialQueue("test");
+  std::vector<int> order;
+  Gate done;
+  queue->async([&] {
+    queue->async([&] {
+      order.push_back(2);
+      done.pass();
+    });
+    order.push_back(1);
+  });
+  ASSERT_TRUE(done.waitFor(1));
+  EXPECT_EQ(order, (std::vector<int>{1, 2}));
+}
+
+TEST(AsioQueuesTest, KeepsTheLabelOfAQueue) {
+  AsioQueues queues(1);
+  EXPECT_EQ(queues.makeSerialQueue("com.quillon.test")->label(), "com.quillon.test");
+}
+
+TEST(AsioQueuesTest, StartsItsThreadsWithTheFirstQueue) {
+  AsioQueues queues(3);
+  EXPECT_EQ(queues.threadCount(), 0U);
+  const auto queue = queues.makeSerialQueue("test");
+  EXPECT_EQ(queues.threadCount(), 3U);
+}
+
+TEST(AsioQueuesTest, HasAtLeastTwoThreadsByDefault) { EXPECT_GE(AsioQueues::defaultThreadCount(), 2U); }
+
+TEST(AsioQueuesTest, DelayedWorkComesAfterItsDelay) {
+  AsioQueues queues(2);
+  const auto queue = queues.makeSerialQueue("test");
+  const auto begin = std::chrono::steady_clock::now();
+  Gate done;
+  queue->asyncAfter(std::chrono::milliseconds(30), [&] { done.pass(); });
+  ASSERT_TRUE(done.waitFor(1));
+  EXPECT_GE(std::chrono::steady_clock::now() - begin, std::chrono::milliseconds(30));
+}
+
+TEST(AsioQueuesTest, AQueueLivesAsLongAsItsWork) {
+  AsioQueues queues(1);
+  Gate done;
+  queues.makeSerialQueue("test")->asyncAfter(std::chrono::milliseconds(5), [&] { done.pass(); });
+  EXPECT_TRUE(done.waitFor(1));
+}
+
+TEST(AsioQueuesTest, DropsWorkThatHasNotStartedAtTheEnd) {
+  const auto held = std::make_shared<int>(1);
+  {
+    AsioQueues queues(1);
+    const auto queue = queues.makeSerialQueue("test");
+    queue->asyncAfter(std::chrono::hours(1), [held] {});
+    EXPECT_EQ(held.use_count(), 2);
+  }
+  EXPECT_EQ(held.use_count(), 1);
+}
+
+class BlockedQueuesTest : public testing::TestWithParam<std::size_t> {};
+
+TEST_P(BlockedQueuesTest, AnyNumberOfBlockedCallsDelaysNoOtherQueue) {
+  constexpr int kBlocked = 40;
+  AsioQueues queues(GetParam());
+  Gate blocked;
+  Gate release;
+  Gate ended;
+  for (int i = 0; i < kBlocked; ++i) {
+    queues.makeSerialQueue("blocked")->async([&] {
+      const auto call = queues.blockingCall();
+      blocked.pass();
+      EXPECT_TRUE(release.waitFor(1));
+      ended.pass();
+    });
+  }
+  ASSERT_TRUE(blocked.waitFor(kBlocked));
+  Gate other;
+  queues.makeSerialQueue("other")->async([&] { other.pass(); });
+  EXPECT_TRUE(other.waitFor(1));
+  EXPECT_EQ(queues.threadCount(), GetParam() + kBlocked);
+  release.pass();
+  ASSERT_TRUE(ended.waitFor(kBlocked));
+}
+
+TEST_P(BlockedQueuesTest, SurplusThreadsLeaveAndAFewAreKeptForTheNextCalls) {
+  constexpr int kBlocked = 40;
+  AsioQueues queues(GetParam());
+  for (int round = 0; round < 3; ++round) {
+    Gate blocked;
+    Gate release;
+    Gate ended;
+    for (int i = 0; i < kBlocked; ++i) {
+      queues.makeSerialQueue("blocked")->async([&] {
+        {
+          const auto call = queues.blockingCall();
+          blocked.pass();
+          EXPECT_TRUE(release.waitFor(1));
+        }
+        ended.pass();
+      });
+    }
+    ASSERT_TRUE(blocked.waitFor(kBlocked));
+    EXPECT_LE(queues.threadCount(), GetParam() + kBlocked);
+    release.pass();
+    ASSERT_TRUE(ended.waitFor(kBlocked));
+    const auto deadline = std::chrono::steady_clock::now() + Gate::kDeadline;
+    while (queues.threadCount() > GetParam() + GrowingPool::kMaximumParked) {
+      ASSERT_LT(std::chrono::steady_clock::now(), deadline);
+      std::this_thread::yield();
+    }
+  }
+}
+
+INSTANTIATE_TEST_SUITE_P(PoolSizes, BlockedQueuesTest, testing::Values(1U, 2U));
+
+TEST(AsioQueuesTest, ABlockingCallOutsideThePoolNeedsNoStandIn) {
+  AsioQueues queues(1);
+  const auto queue = queues.makeSerialQueue("test");
+  const auto call = queues.blockingCall();
+  EXPECT_EQ(queues.threadCount(), 1U);
+}
+
+}  // namespace
+}  // namespace tallyd::platform
