@@ -1,0 +1,99 @@
+#include "platform/ipc/SdBusListener.h"
+
+#include <sys/socket.h>
+
+#include <cerrno>
+#include <chrono>
+#include <cstring>
+#include <mutex>
+#include <utility>
+
+#include "platform/Log.h"
+#include "platform/SerialQueue.h"
+#include "platform/ipc/ListeningSocket.h"
+#include "platform/ipc/SdBusServiceConnection.h"
+
+namespace tallyd::platform {
+
+namespace {
+
+constexpr int kAcceptsPerTurn = 64;  ///< Then other work of the queue's threads comes.
+constexpr std::chrono::milliseconds kPauseWithoutResources{250};
+
+}  // namespace
+
+class SdBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
+ public:
+  Acceptor(const std::filesystem::path& socketPath, Queues& queues, Log& log)
+      : _socket(socketPath),
+        _log(log),
+        _queue(queues.makeSerialQueue("com.quillon.tallyd.listener")),
+        _shared(std::make_shared<SdBusServiceConnection::Shared>(queues)) {}
+
+  void setDelegate(ListenerDelegate& delegate) { _delegate = &delegate; }
+
+  void listen() {
+    const std::lock_guard lock(_mutex);
+    if (_stopped || _source) return;
+    _source =
+        _queue->makeReadSource(_socket.descriptor(), [self = shared_from_this()] { self->acceptSome(); });
+  }
+
+  void stop() {
+    const std::lock_guard lock(_mutex);
+    _stopped = true;
+    _source.reset();
+  }
+
+ private:
+  void acceptSome() {
+    const std::lock_guard lock(_mutex);
+    for (int i = 0; i < kAcceptsPerTurn && !_stopped; ++i) {
+      FileDescriptor client(::accept4(_socket.descriptor(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+      if (!client && !mayGoOn(errno)) return;
+      if (client) welcome(std::move(client));
+    }
+  }
+
+  void welcome(FileDescriptor client) {
+    const auto connection = std::make_shared<SdBusServiceConnection>(std::move(client), _shared, ++_accepted);
+    if (_delegate) _delegate->shouldAcceptNewConnection(connection);
+  }
+
+  bool mayGoOn(int error) {
+    if (error == EAGAIN) {
+      _exhausted = false;  // Everybody who waited has been served.
+      return false;
+    }
+    if (error == EINTR || error == ECONNABORTED) return true;
+    if (!std::exchange(_exhausted, true)) {
+      asl_log(_log, LogLevel::Critical, "Cannot accept connections at present: {}", std::strerror(error));
+    }
+    _source.reset();
+    _queue->asyncAfter(kPauseWithoutResources, [self = shared_from_this()] { self->listen(); });
+    return false;
+  }
+
+  const ListeningSocket _socket;
+  Log& _log;
+  const std::shared_ptr<SerialQueue> _queue;
+  const std::shared_ptr<SdBusServiceConnection::Shared> _shared;
+  ListenerDelegate* _delegate = nullptr;
+
+  std::mutex _mutex;  ///< Held while accepting, so that stop() waits for it.
+  std::unique_ptr<Source> _source;
+  bool _stopped = false;
+  bool _exhausted = false;  ///< Said so already.
+  std::uint64_t _accepted = 0;
+};
+
+SdBusListener::SdBusListener(const std::filesystem::path& socketPath, Queues& queues, Log& log)
+    : _acceptor(std::make_shared<Acceptor>(socketPath, queues, log)) {}
+
+SdBusListener::~SdBusListener() { _acceptor->stop(); }
+
+void SdBusListener::setDelegate(ListenerDelegate& delegate) { _acceptor->setDelegate(delegate); }
+
+void SdBusListener::resume() { _acceptor->listen(); }
+
+}  // namespace tallyd::platform

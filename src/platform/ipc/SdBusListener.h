@@ -1,0 +1,36 @@
+// The daemon's named service: accepts clients on a Unix socket.
+#pragma once
+
+#include <filesystem>
+#include <memory>
+
+#include "platform/IPC.h"
+
+namespace tallyd::platform {
+
+class Log;
+class Queues;
+
+/// Accepts on a serial queue of its own and gives each client's connection to the delegate.
+///
+/// When no descriptor or memory is left it says so in one critical line, pauses, and tries again until every
+/// client that waits has been served; connections that exist go on meanwhile. Threading: setDelegate() and
+/// resume() on one thread; the destructor waits for a delegate call that is under way.
+class SdBusListener final : public Listener {
+ public:
+  /// Makes the socket's folder and takes the socket (see ListeningSocket for what it throws). Borrows queues
+  /// and log.
+  SdBusListener(const std::filesystem::path& socketPath, Queues& queues, Log& log);
+  ~SdBusListener() override;
+  SdBusListener(const SdBusListener&) = delete;
+  SdBusListener& operator=(const SdBusListener&) = delete;
+
+  void setDelegate(ListenerDelegate& delegate) override;
+  void resume() override;
+
+ private:
+  class Acceptor;
+  const std::shared_ptr<Acceptor> _acceptor;
+};
+
+}  // namespace tallyd::platform

@@ -1,0 +1,50 @@
+// What every test of this folder starts from: a service in a folder of its own and clients of it.
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <future>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "RawClient.h"
+#include "TestService.h"
+#include "fakes/FakeLog.h"
+#include "fakes/TemporaryFolder.h"
+#include "platform/ipc/SdBusClientConnection.h"
+
+namespace tallyd::platform {
+
+class IPCTest : public testing::Test {
+ protected:
+  using Reply = SdBusClientConnection::Reply;
+  static constexpr std::chrono::milliseconds kTimeout{60'000};
+
+  IPCTest() { _service.resume(); }
+  ~IPCTest() override {
+    for (const auto& client : _clients) client->close(std::chrono::seconds(5));
+  }
+
+  std::shared_ptr<SdBusClientConnection> makeClient() {
+    return _clients.emplace_back(SdBusClientConnection::connect(_socketPath, testInterface(), _clientQueues));
+  }
+
+  /// Calls and waits for the answer.
+  Reply call(SdBusClientConnection& client, TestMethod method, std::vector<Value> arguments = {},
+             std::vector<FileDescriptor> descriptors = {}, std::chrono::milliseconds timeout = kTimeout) {
+    auto promise = std::make_shared<std::promise<Reply>>();
+    client.call({method, std::move(arguments), std::move(descriptors)}, timeout,
+                [promise](Reply reply) { promise->set_value(std::move(reply)); });
+    return promise->get_future().get();
+  }
+
+  fakes::TemporaryFolder _folder;
+  const std::filesystem::path _socketPath = _folder.path() / "run/service";
+  fakes::FakeLog _log;
+  TestService _service{_socketPath, _log};
+  AsioQueues _clientQueues{1};
+  std::vector<std::shared_ptr<SdBusClientConnection>> _clients;
+};
+
+}  // namespace tallyd::platform
