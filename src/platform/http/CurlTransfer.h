@@ -1,0 +1,85 @@
+// One HTTP request on one libcurl handle.
+#pragma once
+
+#include <cstddef>
+#include <optional>
+#include <string>
+#include <utility>
+
+#include "platform/HTTPClient.h"
+#include "platform/http/CurlHandles.h"
+#include "platform/http/HTTPLimits.h"
+#include "platform/http/TrustAnchors.h"
+
+namespace tallyd::platform {
+
+/// What all transfers have in common; borrowed.
+struct CurlEnvironment {
+  const CurlShare& share;
+  TrustAnchors& anchors;
+  const HTTPLimits& limits;
+};
+
+/// The URL without user, password, query and fragment, as messages may show it; a general phrase when it
+/// can't be parsed.
+[[nodiscard]] std::string urlForMessages(const std::string& url);
+
+/// An error about `request` that no transfer came to.
+[[nodiscard]] HTTPResult failedRequest(const HTTPRequest& request, const std::string& reason);
+
+/// Sets a handle up for a request, receives the response, and says what became of it.
+///
+/// Life cycle: prepare(), then the handle is run by curl_easy_perform or a multi handle, then result(). It
+/// stays where it is from prepare() on: the handle points to it.
+///
+/// Threading: one thread at a time.
+class CurlTransfer {
+ public:
+  enum class ResponseBody { Keep, Drop };
+
+  CurlTransfer(CurlEasy handle, HTTPRequest request, ResponseBody responseBody,
+               const CurlEnvironment& environment);
+  CurlTransfer(const CurlTransfer&) = delete;
+  CurlTransfer& operator=(const CurlTransfer&) = delete;
+
+  /// Sets every option; what is wrong with the request, or nothing.
+  [[nodiscard]] std::optional<std::string> prepare();
+
+  [[nodiscard]] CURL* handle() const { return _handle.get(); }
+  [[nodiscard]] const HTTPRequest& request() const { return _request; }
+  /// Whether a connection was found and the request is on its way.
+  [[nodiscard]] bool hasStarted() const { return _started; }
+
+  [[nodiscard]] HTTPResult result(CURLcode code);
+  /// The handle back, for another use; last.
+  [[nodiscard]] CurlEasy releaseHandle() { return std::move(_handle); }
+
+ private:
+  class Options;
+
+  [[nodiscard]] std::optional<std::string> prepareHeaders();
+  void setMethod(Options& options);
+  void setConnection(Options& options);
+  void setTimes(Options& options);
+  void setCallbacks(Options& options);
+  [[nodiscard]] HTTPResponse response() const;
+  [[nodiscard]] bool received(const char* bytes, std::size_t size, ResponseBody use);
+
+  static std::size_t onBody(char* bytes, std::size_t size, std::size_t count, void* self);
+  static std::size_t onHeader(char* bytes, std::size_t size, std::size_t count, void* self);
+  static int onStart(void* self, char* primary, char* local, int primaryPort, int localPort);
+  static CURLcode onTLSContext(CURL* handle, void* context, void* anchors);
+
+  CurlEasy _handle;
+  const HTTPRequest _request;
+  const ResponseBody _responseBody;
+  const CurlEnvironment& _environment;
+  CurlList _headers;
+  std::array<char, CURL_ERROR_SIZE> _error{};
+  std::string _body;
+  std::size_t _receivedBytes = 0;
+  bool _tooLarge = false;
+  bool _started = false;
+};
+
+}  // namespace tallyd::platform

@@ -1,0 +1,74 @@
+// A TCP server on the loopback interface that does just what a test's script says, byte for byte.
+#pragma once
+
+#include <atomic>
+#include <functional>
+#include <list>
+#include <mutex>
+#include <string>
+#include <string_view>
+#include <thread>
+
+#include "platform/FileDescriptor.h"
+
+namespace tallyd::test {
+
+/// One accepted connection, as the script sees it.
+class RawConnection {
+ public:
+  RawConnection(int descriptor, int number) : _descriptor(descriptor), _number(number) {}
+
+  /// The bytes of one request, header and body (of its Content-Length); empty when the client has hung up.
+  [[nodiscard]] std::string readRequest();
+  void write(std::string_view bytes);
+  /// Waits until the client hangs up or the server goes away.
+  void waitForClose();
+  /// Which accepted connection this is, from 1.
+  [[nodiscard]] int number() const { return _number; }
+
+ private:
+  [[nodiscard]] bool readMore();
+
+  const int _descriptor;
+  const int _number;
+  std::string _received;
+};
+
+/// Runs the script once for each connection, each on a thread of its own, and closes the connection after it.
+/// Destroying the server hangs up on every client.
+class RawServer {
+ public:
+  using Script = std::function<void(RawConnection& connection)>;
+
+  explicit RawServer(Script script);
+  ~RawServer();
+  RawServer(const RawServer&) = delete;
+  RawServer& operator=(const RawServer&) = delete;
+
+  [[nodiscard]] int port() const { return _port; }
+  [[nodiscard]] std::string url(const std::string& path = "/") const;
+  [[nodiscard]] int connectionCount() const { return _accepted; }
+
+ private:
+  struct Client {
+    platform::FileDescriptor descriptor;
+    std::thread thread;
+  };
+  void acceptClients();
+  void runScript(Client& client, int number);
+
+  const Script _script;
+  platform::FileDescriptor _listener;
+  int _port = 0;
+  std::atomic<int> _accepted{0};
+  std::mutex _mutex;
+  std::list<Client> _clients;
+  bool _stopping = false;
+  std::thread _thread;
+};
+
+/// A socket that listens on 127.0.0.1 at a port that the system chose.
+[[nodiscard]] platform::FileDescriptor listenOnLoopback();
+[[nodiscard]] int portOf(int socket);
+
+}  // namespace tallyd::test

@@ -1,0 +1,31 @@
+// The storebags that the station serves: readable property lists in a folder.
+#pragma once
+
+#include <filesystem>
+#include <string>
+
+#include "station/OpenSSLObjects.h"
+
+namespace tallyd::station {
+
+/// Serves DIR/NAME.plist, read anew at each request, as a signed storebag.
+///
+/// Threading: any thread.
+class BagFolder {
+ public:
+  struct Answer {
+    int status;        ///< 200, 404 for a name without a file, 500 for a file that is no bag.
+    std::string body;  ///< The envelope, or what is wrong, with the file's name.
+  };
+
+  /// Borrows the key. The folder need not be there yet.
+  BagFolder(std::filesystem::path directory, EVP_PKEY* key) : _directory(std::move(directory)), _key(key) {}
+
+  [[nodiscard]] Answer storebag(const std::string& name) const;
+
+ private:
+  const std::filesystem::path _directory;
+  EVP_PKEY* const _key;
+};
+
+}  // namespace tallyd::station
