@@ -1,0 +1,191 @@
+#include "support/MessageLog.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <system_error>
+
+#include "platform/FileDescriptor.h"
+#include "platform/Log.h"
+#include "platform/Platform.h"
+#include "platform/Settings.h"
+
+namespace tallyd {
+
+using platform::asl_log;
+using platform::Date;
+using platform::FileDescriptor;
+using platform::LogLevel;
+using platform::Value;
+
+namespace {
+
+constexpr std::string_view kDirectory = "/var/mobile/Library/Logs/CrashReporter/Retired";
+constexpr std::string_view kFileNameStart = "tallyd";
+constexpr std::string_view kFileNameEnd = "messageLog.diag";
+constexpr std::string_view kPathKey = "logFilePath";
+constexpr std::string_view kCreationDateKey = "logFileCreationDate";
+
+bool isDirectory(const std::string& path) {
+  std::error_code ignored;
+  return std::filesystem::is_directory(path, ignored);
+}
+
+bool exists(const std::string& path) {
+  std::error_code ignored;
+  return std::filesystem::exists(path, ignored);
+}
+
+void createDirectories(const std::string& path) {
+  std::error_code ignored;
+  std::filesystem::create_directories(path, ignored);
+}
+
+/// When the file was made, or last changed where the file system does not keep that.
+std::optional<Date> creationDate(const std::string& path) {
+  struct statx facts {};
+  if (statx(AT_FDCWD, path.c_str(), 0, STATX_BTIME | STATX_MTIME, &facts) != 0) return std::nullopt;
+  const auto& time = (facts.stx_mask & STATX_BTIME) != 0 ? facts.stx_btime : facts.stx_mtime;
+  return Date{static_cast<double>(time.tv_sec) + time.tv_nsec / 1e9};
+}
+
+std::string describe(const std::optional<std::string>& path) { return path.value_or("(null)"); }
+std::string describe(const std::optional<Date>& date) { return date ? Value(*date).description() : "(null)"; }
+
+std::string errorText(int error) { return std::generic_category().message(error); }
+
+/// Writes all of `text`; the error's number when it can't.
+int writeAll(int descriptor, std::string_view text) {
+  while (!text.empty()) {
+    const ssize_t written = ::write(descriptor, text.data(), text.size());
+    if (written < 0 && errno == EINTR) continue;
+    if (written < 0) return errno;
+    text.remove_prefix(static_cast<std::size_t>(written));
+  }
+  return 0;
+}
+
+}  // namespace
+
+bool isMessageLogFileName(std::string_view name) {
+  if (std::count(name.begin(), name.end(), '_') != 2) return false;
+  return name.substr(0, name.find('_')) == kFileNameStart && name.substr(name.rfind('_') + 1) == kFileNameEnd;
+}
+
+MessageLog::MessageLog(const platform::Platform& platform)
+    : _platform(platform), _directory(platform.root.under(kDirectory).string()) {}
+
+void MessageLog::writeMessageLog(std::string_view message) {
+  const std::lock_guard lock(_mutex);
+  _platform.process.logDirectoryChecked.get([this] {
+    ensureLogDirectory();
+    return std::monostate();
+  });
+  CurrentFile file = savedFile();
+  if (!file.path || !file.created) file = findExistingFile(std::move(file));
+  if (isExpired(file)) {
+    retire(file);
+    file = {};
+  }
+  // A date alone names no file; a path alone is written to as it is until a later search finds its date.
+  if (!file.path) file = createFile();
+  if (file.path) append(*file.path, message);
+  remember(file);
+}
+
+void MessageLog::ensureLogDirectory() {
+  asl_log(_platform.log, LogLevel::Info, "Checking for tallyd log directory {}", _directory);
+  if (isDirectory(_directory)) {
+    asl_log(_platform.log, LogLevel::Info, "Found tallyd log directory {}", _directory);
+    return;
+  }
+  asl_log(_platform.log, LogLevel::Info, "Creating tallyd log directory {}", _directory);
+  createDirectories(_directory);
+}
+
+MessageLog::CurrentFile MessageLog::savedFile() {
+  CurrentFile file;
+  if (const auto path = _platform.defaults.value(kPathKey); path && path->string()) {
+    file.path = std::string(*path->string());
+  }
+  if (const auto created = _platform.defaults.value(kCreationDateKey)) file.created = created->date();
+  if (!file.path || exists(*file.path)) return file;
+  asl_log(_platform.log, LogLevel::Info, "Saved tallyd log file {} not found - invalidating file path",
+          *file.path);
+  return {};
+}
+
+MessageLog::CurrentFile MessageLog::findExistingFile(CurrentFile file) {
+  asl_log(_platform.log, LogLevel::Info, "Searching for existing tallyd log file in {}", _directory);
+  const auto name = firstListedFile();
+  if (!name) return file;
+  file.path = _directory + "/" + *name;
+  file.created = creationDate(*file.path);
+  asl_log(_platform.log, LogLevel::Info, "Found existing tallyd log file {} ({})", *file.path,
+          describe(file.created));
+  return file;
+}
+
+std::optional<std::string> MessageLog::firstListedFile() {
+  std::error_code error;
+  std::filesystem::directory_iterator entry(_directory, error);
+  for (; !error && entry != std::filesystem::directory_iterator(); entry.increment(error)) {
+    std::string name = entry->path().filename().string();
+    if (isMessageLogFileName(name)) return name;
+  }
+  if (error == std::errc::no_such_file_or_directory) {
+    asl_log(_platform.log, LogLevel::Info, "Creating tallyd log directory at {}", _directory);
+    createDirectories(_directory);
+  } else if (error) {
+    asl_log(_platform.log, LogLevel::Critical, "Error reading from log directory: {}", error.message());
+  }
+  return std::nullopt;
+}
+
+bool MessageLog::isExpired(const CurrentFile& file) const {
+  if (!file.created) return false;
+  const double age = platform::secondsSince1970(_platform.clock.now()) - file.created->secondsSince1970;
+  return age > static_cast<double>(kMaximumAge.count());
+}
+
+void MessageLog::retire(const CurrentFile& file) {
+  asl_log(_platform.log, LogLevel::Info, "Deleting expired tallyd log file {} ({})", describe(file.path),
+          describe(file.created));
+  std::error_code ignored;
+  if (file.path) std::filesystem::remove(*file.path, ignored);
+}
+
+MessageLog::CurrentFile MessageLog::createFile() {
+  const auto seconds = static_cast<std::int32_t>(_platform.clock.timeOfDay().tv_sec);
+  const std::string path = fmt::format("{}/{}_{}_{}", _directory, kFileNameStart, seconds, kFileNameEnd);
+  constexpr mode_t kMode = 0644;
+  FileDescriptor(::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, kMode)).reset();
+  if (!exists(path)) {
+    asl_log(_platform.log, LogLevel::Critical, "Failed to create new tallyd log file {}", path);
+    return {};
+  }
+  const auto created = creationDate(path);
+  asl_log(_platform.log, LogLevel::Info, "Created new tallyd log file {} ({})", path, describe(created));
+  return {path, created};
+}
+
+void MessageLog::append(const std::string& path, std::string_view message) {
+  const std::string line = fmt::format(
+      "({}) {}\n", Value(platform::dateFromTimePoint(_platform.clock.now())).description(), message);
+  const FileDescriptor file(::open(path.c_str(), O_WRONLY | O_APPEND | O_CLOEXEC));
+  if (const int error = file ? writeAll(file.get(), line) : errno) {
+    asl_log(_platform.log, LogLevel::Critical, "Error writing to tallyd log file {}: {}", path,
+            errorText(error));
+  }
+  asl_log(_platform.log, LogLevel::Info, "Saved log message to {}", path);
+}
+
+void MessageLog::remember(const CurrentFile& file) {
+  _platform.defaults.setValue(kPathKey, file.path ? std::optional<Value>(*file.path) : std::nullopt);
+  _platform.defaults.setValue(kCreationDateKey,
+                              file.created ? std::optional<Value>(*file.created) : std::nullopt);
+}
+
+}  // namespace tallyd

@@ -1,0 +1,71 @@
+// The daemon's diary: one line per report sent, in a file that is replaced once a day.
+#pragma once
+
+#include <fmt/format.h>
+
+#include <chrono>
+#include <filesystem>
+#include <mutex>
+#include <optional>
+#include <string_view>
+
+#include "platform/Clock.h"
+
+namespace tallyd::platform {
+struct Platform;
+}
+
+namespace tallyd {
+
+/// Appends time-stamped lines to the current message log file and retires the file when it is a day old.
+///
+/// The current file's path and creation date survive restarts in the standard user defaults; when they are
+/// lost, the file is found again by its name. Every failure is logged and costs at most the one line.
+///
+/// Threading: any thread; calls are serialised by an internal lock, and each blocks on the disk.
+class MessageLog {
+ public:
+  static constexpr std::chrono::seconds kMaximumAge{86'400};  ///< A file older than this is replaced.
+
+  /// Borrows the platform. Touches no file.
+  explicit MessageLog(const platform::Platform& platform);
+
+  /// Appends "(DATE) MESSAGE\n".
+  ///
+  /// @param message  UTF-8, any length, without the line feed.
+  void writeMessageLog(std::string_view message);
+
+  template <class... Arguments>
+  void writeMessageLog(fmt::format_string<Arguments...> format,
+                       Arguments&&... arguments) requires(sizeof...(Arguments) > 0) {
+    writeMessageLog(std::string_view(fmt::format(format, std::forward<Arguments>(arguments)...)));
+  }
+
+ private:
+  /// The file that lines go to; either half may be missing.
+  struct CurrentFile {
+    std::optional<std::string> path;
+    std::optional<platform::Date> created;
+  };
+
+  void ensureLogDirectory();
+  CurrentFile savedFile();
+  CurrentFile findExistingFile(CurrentFile file);
+  /// The first message log file in the directory's listing; creates a directory that is missing.
+  std::optional<std::string> firstListedFile();
+  bool isExpired(const CurrentFile& file) const;
+  void retire(const CurrentFile& file);
+  CurrentFile createFile();
+  void append(const std::string& path, std::string_view message);
+  void remember(const CurrentFile& file);
+
+  const platform::Platform& _platform;
+  const std::string _directory;
+  std::mutex _mutex;
+};
+
+/// Whether a directory entry is a message log file: "tallyd", anything without "_", and "messageLog.diag",
+/// joined by "_".
+[[nodiscard]] bool isMessageLogFileName(std::string_view name);
+
+}  // namespace tallyd
