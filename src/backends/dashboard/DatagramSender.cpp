@@ -1,0 +1,155 @@
+#include "backends/dashboard/DatagramSender.h"
+
+#include <sys/socket.h>
+
+#include <array>
+#include <cerrno>
+#include <exception>
+
+#include "platform/Log.h"
+
+namespace tallyd {
+
+using platform::asl_log;
+using platform::LogLevel;
+using platform::Source;
+
+namespace {
+
+/// The source that `make` makes; null when the queue does not take it.
+template <class Make>
+std::unique_ptr<Source> sourceOrNothing(Make&& make) {
+  try {
+    return make();
+  } catch (const std::exception&) {
+    return nullptr;
+  }
+}
+
+const sockaddr* generic(const sockaddr_in& address) { return reinterpret_cast<const sockaddr*>(&address); }
+
+}  // namespace
+
+DatagramSender::DatagramSender(platform::Log& log, platform::Queues& queues, platform::FileDescriptor socket)
+    : _log(log),
+      _networkProcQueue(queues.makeSerialQueue("com.quillon.Tally.networkProc")),
+      _socket(std::move(socket)) {}
+
+void DatagramSender::useReliableUDP() {
+  sockaddr_in anyPort{};
+  anyPort.sin_family = AF_INET;
+  anyPort.sin_addr.s_addr = htonl(INADDR_ANY);
+  if (::bind(_socket.get(), generic(anyPort), sizeof anyPort) != 0) {
+    asl_log(_log, LogLevel::Error, "Tally (DashboardBackend): can't bind socket, {:d}", errno);
+    return;
+  }
+  _delivery = Delivery::Reliable;
+  _readSource = sourceOrNothing([self = shared_from_this()] {
+    return self->_networkProcQueue->makeReadSource(
+        self->_socket.get(), [self] { self->processSocketRead(); }, [self] { self->_socket.reset(); });
+  });
+  if (!_readSource) asl_log(_log, LogLevel::Error, "Tally (setReliable): can't create read source");
+}
+
+bool DatagramSender::start(const sockaddr_in& server, Milliseconds period) {
+  if (::connect(_socket.get(), generic(server), sizeof server) != 0) {
+    asl_log(_log, LogLevel::Error, "Tally (DashboardBackend): initWitName socket connect failed.");
+    _readSource.reset();
+    return false;
+  }
+  // The descriptor must outlast every source on it.
+  const bool closesSocket = !_readSource;
+  _timer = sourceOrNothing([&, self = shared_from_this()] {
+    return _networkProcQueue->makeTimer(
+        period, period, [self] { self->myPeriodicTask(); },
+        [self, closesSocket] {
+          if (closesSocket) self->_socket.reset();
+        });
+  });
+  if (!_timer) {
+    asl_log(_log, LogLevel::Error, "Tally (DashboardBackend): initWithName can't create timer source.");
+    _readSource.reset();
+    return false;
+  }
+  _isStarted = true;
+  return true;
+}
+
+void DatagramSender::send(std::shared_ptr<const Datagram> datagram) {
+  _networkProcQueue->async(
+      [self = shared_from_this(), datagram = std::move(datagram)] { self->tryToSendMsg(*datagram); });
+}
+
+void DatagramSender::cleanup() {
+  _networkProcQueue->async([self = shared_from_this()] {
+    if (self->_messageQueue.empty()) {
+      self->cleanupSources();
+    } else {
+      self->_cleanupState = CleanupRequested;
+    }
+  });
+}
+
+void DatagramSender::drop() {
+  if (!_isStarted) return;
+  _networkProcQueue->async([self = shared_from_this()] {
+    if (self->_cleanupState != CleanupNotAsked) return;
+    self->_ticksAfterDrop = kTicksAfterDrop;
+    if (self->_messageQueue.empty()) self->cleanupSources();
+  });
+}
+
+// Everything below runs on the queue.
+
+void DatagramSender::tryToSendMsg(const Datagram& datagram) {
+  const bool isSent = sendAllBytes(datagram.bytes());
+  if (isSent && _delivery == Delivery::FireAndForget) return;
+  UDPPacketToSend packet(datagram.bytes(), datagram.eventID());
+  if (isSent) packet.setState(PacketStateWaiting);
+  _messageQueue.append(std::move(packet));
+}
+
+bool DatagramSender::sendAllBytes(std::string_view bytes) const {
+  const ssize_t sent = ::send(_socket.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
+  return sent == static_cast<ssize_t>(bytes.size());
+}
+
+void DatagramSender::myPeriodicTask() {
+  _messageQueue.tick(_delivery, [this](std::string_view bytes) { return sendAllBytes(bytes); });
+  if (_cleanupState != CleanupNotAsked) {
+    advanceCleanup();
+  } else if (_ticksAfterDrop) {
+    advanceDrop();
+  }
+}
+
+void DatagramSender::advanceCleanup() {
+  if (_messageQueue.empty()) {
+    asl_log(_log, LogLevel::Debug, "Tally: clean up at myPeriodicTask.");
+    cleanupSources();
+  } else if (_cleanupState == CleanupRequested) {
+    _cleanupState = CleanupLastResortScheduled;
+    asl_log(_log, LogLevel::Debug, "Tally: scheduled last resort clean-up in {:d} ms.",
+            kLastResortDelay.count());
+    _networkProcQueue->asyncAfter(kLastResortDelay, [self = shared_from_this()] { self->cleanupSources(); });
+  }
+}
+
+void DatagramSender::advanceDrop() {
+  if (_messageQueue.empty() || --*_ticksAfterDrop == 0) cleanupSources();
+}
+
+void DatagramSender::processSocketRead() {
+  std::array<char, kDatagramBufferBytes> received{};
+  const ssize_t length = ::recvfrom(_socket.get(), received.data(), received.size(), 0, nullptr, nullptr);
+  if (length < 1) return;
+  const auto eventID = acknowledgedEventID({received.data(), static_cast<std::size_t>(length)});
+  if (eventID) _messageQueue.acknowledge(*eventID);
+}
+
+void DatagramSender::cleanupSources() {
+  _timer.reset();
+  _readSource.reset();
+}
+
+}  // namespace tallyd

@@ -1,0 +1,43 @@
+// Which datagrams are sent again when, and which are given up: reliable delivery without a socket or a clock.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <string_view>
+#include <vector>
+
+#include "backends/dashboard/UDPPacketToSend.h"
+
+namespace tallyd {
+
+enum class Delivery {
+  FireAndForget,  ///< A datagram is done when it was sent.
+  Reliable,       ///< A datagram is done when it was acknowledged, or given up.
+};
+
+/// The datagrams of one server that wait, oldest first; at most 50, the oldest goes for one more.
+///
+/// A datagram that was sent and is not acknowledged is sent again 2 ticks later, then after 3, 5 and 9 more,
+/// and given up on the tick after the last. Threading: one thread at a time.
+class MessageQueue {
+ public:
+  /// Sends a datagram and tells whether all of it went.
+  using Send = std::function<bool(std::string_view bytes)>;
+
+  static constexpr std::size_t kMaximumPackets = 50;
+
+  void append(UDPPacketToSend packet);
+  /// Removes the oldest datagram of this event, if there is one.
+  void acknowledge(std::uint16_t eventNumber);
+  /// Sends what is due and removes what is done.
+  void tick(Delivery delivery, const Send& send);
+
+  [[nodiscard]] bool empty() const { return _packets.empty(); }
+  [[nodiscard]] const std::vector<UDPPacketToSend>& packets() const { return _packets; }
+
+ private:
+  std::vector<UDPPacketToSend> _packets;
+};
+
+}  // namespace tallyd

@@ -1,0 +1,89 @@
+// Posts messages as JSON documents over HTTPS, one by one or in batches.
+#pragma once
+
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "backends/TallyBackend.h"
+#include "backends/https-post/EventFilters.h"
+#include "backends/https-post/ReportingRules.h"
+
+namespace tallyd::platform {
+class SerialQueue;
+}
+
+namespace tallyd {
+
+/// Turns each message into a flat event record and posts it, gzipped when that is shorter, or holds it back
+/// in a batch while it may not be posted yet or batching is asked for.
+///
+/// A batch holds at most threshold + 1 events of one method. Posts go to the shared transfer engine and are
+/// not retried; what becomes of them is only logged. Threading: the session's queue; the posts' completions
+/// run on a queue of the backend's own and touch no backend.
+class HTTPSPostBackend final : public TallyBackend {
+ public:
+  static constexpr std::int32_t kDefaultEventThreshold = 49;
+
+  /// Null without a profile or a product family, and without a client list in the profile (one error line).
+  [[nodiscard]] static std::shared_ptr<HTTPSPostBackend> initWithName(
+      const platform::Platform& platform, std::string_view name, const Payload& profile,
+      const std::optional<std::string>& productFamily);
+  /// Posts a batch that may be posted.
+  ~HTTPSPostBackend() override;
+
+  using TallyBackend::sendMessage;
+  /// The posted document when the user consents to see it; nothing when nothing was posted.
+  Result sendMessage(const Payload& payload, const timeval& timestamp, std::uint16_t method,
+                     std::uint16_t respCode, std::uint16_t eventID) override;
+  Result flushMessages() override;
+  /// Also renames the session of the events held back.
+  void setCorrelatedSessionID(const std::string& correlatedSessionID) override;
+  /// Evaluates the storebag's rules, and posts the batch when they now let it go.
+  void updateState() override;
+
+  [[nodiscard]] const std::optional<std::string>& postURL() const { return _postURL; }
+  void setPostURL(std::optional<std::string> url) { _postURL = std::move(url); }
+  [[nodiscard]] DNUType dnuType() const { return _dnuType; }
+  [[nodiscard]] std::int32_t eventThreshold() const { return _eventThreshold; }
+  [[nodiscard]] std::size_t batchedEventCount() const { return _batchedEvents ? _batchedEvents->size() : 0; }
+
+ private:
+  using Events = std::vector<Dictionary>;
+
+  HTTPSPostBackend(const platform::Platform& platform, std::string_view name, const Payload& profile,
+                   const std::optional<std::string>& productFamily);
+
+  std::int32_t updateBackendState();
+  void applyEntry(const ReportingDecision& decision);
+  void applySampledEntry(const ReportingDecision& decision);
+  void takePostURL(const std::string& storebagURL);
+
+  Payload stopMessagePayload(const Payload& payload) const;
+  Dictionary createEventDictfromPayload(const Payload& payload, const timeval& timestamp,
+                                        std::uint16_t method, std::uint16_t respCode,
+                                        std::uint16_t eventID) const;
+  void batchEvent(Dictionary event);
+  [[nodiscard]] bool hasRequiredUserInfo() const { return !_requireUserInfo || _userInfoDict; }
+  /// Prepares and takes the batch away; what is left is no batch.
+  std::optional<std::string> takeBatchForPost();
+  void prepareEventArrayForMessage(Events& events) const;
+  std::optional<std::string> createMessageForPost(Events events) const;
+  Result postJsonMessage(const std::string& json) const;
+
+  const std::shared_ptr<platform::SerialQueue> _queue;
+  std::optional<std::string> _postURL;
+  std::optional<Events> _batchedEvents;  ///< Nothing until an event is held back, and after each flush.
+  EventFilters _filters;
+  const bool _dnuEnabled;
+  DNUType _dnuType = DNUTypeConsent;
+  std::int32_t _eventThreshold = kDefaultEventThreshold;
+  std::int32_t _extrasOnInternal = 0;
+  std::optional<platform::Value> _samplingThreshold;
+  std::map<std::string, std::int32_t, std::less<>>
+      _eventMethodCounts;  ///< Events of each method in the batch.
+};
+
+}  // namespace tallyd
