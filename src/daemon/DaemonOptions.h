@@ -1,0 +1,29 @@
+// The daemon's command line.
+#pragma once
+
+#include <filesystem>
+#include <optional>
+#include <string>
+
+#include "platform/log/LogDestination.h"
+
+namespace tallyd {
+
+struct DaemonOptions {
+  std::filesystem::path root = "/";
+  platform::LogDestination logDestination = platform::LogDestination::StandardError;
+  platform::LogLevel logLevel = platform::LogLevel::Debug;
+  bool sandbox = true;
+};
+
+/// The options, or the status to exit with when the command line asked for help or is wrong, which has then
+/// been said.
+struct ParsedOptions {
+  std::optional<DaemonOptions> options;
+  int exitStatus = 0;
+};
+
+/// Reads the command line and the environment variables TALLY_ROOT and TALLY_LOG, which it overrides.
+[[nodiscard]] ParsedOptions parseDaemonOptions(int argumentCount, const char* const* arguments);
+
+}  // namespace tallyd

@@ -1,0 +1,26 @@
+// The platform's production services, wired together.
+#pragma once
+
+#include <memory>
+
+#include "platform/Platform.h"
+
+namespace tallyd {
+
+/// Owns every service but those that exist before the sandbox is entered. Its threads start when it is used,
+/// so it is made after that.
+class ProductionPlatform {
+ public:
+  /// Borrows all four; they must outlive this object.
+  ProductionPlatform(const platform::Root& root, platform::Log& log, const platform::Clock& clock,
+                     platform::Sandbox& sandbox);
+  ~ProductionPlatform();
+
+  [[nodiscard]] const platform::Platform& platform() const;
+
+ private:
+  struct Services;
+  std::unique_ptr<Services> _services;
+};
+
+}  // namespace tallyd
