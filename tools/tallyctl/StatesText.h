@@ -1,0 +1,17 @@
+// Reporting states in words.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace tallyd::tallyctl {
+
+/// "a, b", "none", or "no storebag" when there are no states.
+[[nodiscard]] std::string statesText(const std::optional<std::vector<std::string>>& states);
+
+/// Why nothing that is sent gets anywhere.
+[[nodiscard]] std::string noStorebagText(std::int32_t clientType);
+
+}  // namespace tallyd::tallyctl
