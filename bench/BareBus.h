@@ -1,0 +1,52 @@
+// Server and client that use sd-bus and nothing else: the floor of a call's round trip and of a connection's
+// memory.
+#pragma once
+
+#include <filesystem>
+#include <memory>
+#include <string>
+
+#include "fakes/TemporaryFolder.h"
+#include "platform/Value.h"
+
+struct sd_bus;
+
+namespace tallyd::bench {
+
+class ServerProcess;
+
+/// Serves the socket until the process is ended: takes connections as the daemon does, and answers
+/// FetchDisplayURL and SendMessageWithCategory as it does without a backend, arguments unread.
+[[noreturn]] void runBareServer(const std::filesystem::path& socketPath);
+
+/// This program, running runBareServer() in a process of its own.
+class BareServer {
+ public:
+  BareServer();
+  ~BareServer();
+
+  [[nodiscard]] std::filesystem::path socket() const { return _folder.path() / "bus"; }
+  [[nodiscard]] int id() const;
+
+ private:
+  fakes::TemporaryFolder _folder;
+  std::unique_ptr<ServerProcess> _process;
+};
+
+/// A connection to either server; calls block. Throws std::system_error.
+class BareClient {
+ public:
+  explicit BareClient(const std::filesystem::path& socketPath);
+  ~BareClient();
+  BareClient(const BareClient&) = delete;
+  BareClient& operator=(const BareClient&) = delete;
+
+  void fetchDisplayURL();
+  /// @param payload  strings, integers, reals and booleans only.
+  void sendMessage(const platform::Dictionary& payload);
+
+ private:
+  sd_bus* _bus = nullptr;
+};
+
+}  // namespace tallyd::bench

@@ -1,0 +1,103 @@
+#include <sys/time.h>
+
+#include <stdexcept>
+
+#include "Events.h"
+#include "Figures.h"
+#include "Measure.h"
+#include "ZlibFloor.h"
+#include "backends/https-post/EventRecord.h"
+#include "backends/https-post/PostBody.h"
+#include "support/GzipCompression.h"
+
+namespace tallyd::bench {
+
+using platform::Dictionary;
+
+namespace {
+
+constexpr int kBatches = 200;
+constexpr int kQuickBatches = 30;
+
+class NoLog final : public platform::Log {
+ public:
+  NoLog() : Log(platform::LogLevel::Warning) {}
+  void open(std::string_view /*identity*/, std::string_view /*facility*/) override {}
+  void close() override {}
+  void write(platform::LogLevel /*level*/, std::string_view message) override {
+    throw std::runtime_error(std::string(message));
+  }
+};
+
+EventFacts factsOf(std::size_t number) {
+  constexpr double kSessionStart = 1'760'000'123.25;
+  return {.sessionStart = kSessionStart,
+          .sender = "pl",
+          .clientVersion = 1,
+          .sessionID = "5Q0kK3sVTv2jXW9mJm0b7A==",
+          .eventNumber = static_cast<std::uint16_t>(number),
+          .method = kCategory,
+          .status = kType,
+          .eventTime = kSessionStart + static_cast<double>(number) / 8,
+          .productFamily = "Kasten",
+          .productModel = "Kasten7,1",
+          .osVersion = "12",
+          .build = "6.1.0-18-amd64",
+          .isInternal = false,
+          .reportVersionMajor = 7,
+          .reportVersionMinor = 0,
+          .timezoneOffset = std::chrono::seconds(3600)};
+}
+
+std::string jsonOfEvents(const std::vector<Dictionary>& payloads, platform::Log& log) {
+  std::vector<Dictionary> events;
+  events.reserve(payloads.size());
+  for (std::size_t number = 0; number < payloads.size(); ++number) {
+    events.push_back(eventRecord(payloads[number], factsOf(number)));
+  }
+  for (Dictionary& event : events) sanitizeEventForJSON(event, log);
+  return *postBody({1'760'000'200, 125'000}, "6f1cbb53-52a8-5f0c-9d0a-0d1a4c6b7e21", std::move(events));
+}
+
+/// Microseconds of processor time for one of `count` calls.
+template <class Work>
+double processorTime(int count, Work&& work) {
+  constexpr double kMicroseconds = 1e6;
+  const double start = processorSecondsOfThisThread();
+  for (int i = 0; i < count; ++i) work();
+  return (processorSecondsOfThisThread() - start) * kMicroseconds / count;
+}
+
+}  // namespace
+
+void measureBatch(const Settings& settings, Figures& figures) {
+  if (!settings.wants("batch/")) return;
+  const int batches = settings.quick ? kQuickBatches : kBatches;
+  NoLog log;
+  Deflater deflater;
+  std::vector<Dictionary> payloads;
+  for (std::size_t number = 0; number < kBatchSize; ++number) payloads.push_back(payload(number));
+  const std::string ofBatch = jsonOfEvents(payloads, log);
+  const std::string ofOne = jsonOfEvents({payloads[0]}, log);
+
+  const auto measure = [&](const char* name, const char* unit, const std::string& document,
+                           const auto& work) {
+    if (!settings.wants(name)) return;
+    const auto floor = [&] { keep(deflater.deflate(document)); };
+    Figure figure{.name = name, .unit = unit, .floorName = "zlib alone"};
+    processorTime(batches / 10, work);
+    processorTime(batches / 10, floor);
+    for (int run = 0; run < settings.runs(); ++run) {
+      const double value = processorTime(batches, work);
+      figure.add(value, processorTime(batches, floor));
+    }
+    figures.push_back(std::move(figure));
+  };
+  measure("batch/record-json-gzip", "us/50", ofBatch,
+          [&] { keep(gzipDeflate(jsonOfEvents(payloads, log), log)->size()); });
+  measure("batch/record-json", "us/50", ofBatch, [&] { keep(jsonOfEvents(payloads, log).size()); });
+  measure("batch/gzip", "us/50", ofBatch, [&] { keep(gzipDeflate(ofBatch, log)->size()); });
+  measure("batch/gzip-one-event", "us", ofOne, [&] { keep(gzipDeflate(ofOne, log)->size()); });
+}
+
+}  // namespace tallyd::bench
