@@ -29,7 +29,4 @@ enum class ClientSessionMethod : std::size_t {
 /// Where the service's socket lies below a root.
 [[nodiscard]] std::filesystem::path tallydSocketPath(const platform::Root& root);
 
-/// What an upload's extension token starts with; the file's path follows.
-inline constexpr std::string_view kFileTokenPrefix = "tally.file:";
-
 }  // namespace tallyd

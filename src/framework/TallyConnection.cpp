@@ -7,6 +7,7 @@
 #include <utility>
 
 #include "framework/ClientSessionInterface.h"
+#include "platform/Sandbox.h"
 #include "platform/ipc/SdBusClientConnection.h"
 #include "platform/queues/AsioQueues.h"
 
@@ -233,7 +234,7 @@ void TallyConnection::uploadFile(const std::filesystem::path& file, Completion<b
   const Array placeholders(std::vector<Value>(grant.size()));
   _channel->call(
       ClientSessionMethod::UploadFileAtPath,
-      {Value(fileURL(path.string())), Value(std::string(kFileTokenPrefix) + path.string()), placeholders},
+      {Value(fileURL(path.string())), Value(std::string(platform::kFileTokenPrefix) + path.string()), placeholders},
       readTruth, std::move(completion), std::move(grant));
 }
 

@@ -12,6 +12,9 @@
 
 namespace tallyd::platform {
 
+/// Extension tokens of files are this and the file's path.
+inline constexpr std::string_view kFileTokenPrefix = "tally.file:";
+
 /// Threading: enter before any thread starts; the rest from any thread.
 class Sandbox {
  public:

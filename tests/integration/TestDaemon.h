@@ -33,13 +33,13 @@ class StorebagServer {
   [[nodiscard]] std::string baseURL() const;
   [[nodiscard]] static std::string publicKeyDER();
   [[nodiscard]] const std::string& authorityPEM() const { return _authority.certificatePEM(); }
-  [[nodiscard]] const station::CertificateAuthority& authority() const { return _authority; }
+  [[nodiscard]] const signing::CertificateAuthority& authority() const { return _authority; }
   [[nodiscard]] LoopbackServer& http() { return *_server; }
 
  private:
   ServedResponse answer(const ReceivedRequest& request);
 
-  station::CertificateAuthority _authority;
+  signing::CertificateAuthority _authority;
   std::mutex _mutex;
   std::map<std::string, LoopbackServer::Handler> _handlers;
   std::unique_ptr<LoopbackServer> _server;

@@ -19,14 +19,14 @@ namespace {
 constexpr std::size_t kThreads = 16;
 constexpr std::chrono::seconds kPatience{20};
 
-station::OpenSSLPointer<X509> certificateFromPEM(const std::string& pem) {
-  const station::OpenSSLPointer<BIO> bio(BIO_new_mem_buf(pem.data(), static_cast<int>(pem.size())));
-  return station::OpenSSLPointer<X509>(PEM_read_bio_X509(bio.get(), nullptr, nullptr, nullptr));
+signing::OpenSSLPointer<X509> certificateFromPEM(const std::string& pem) {
+  const signing::OpenSSLPointer<BIO> bio(BIO_new_mem_buf(pem.data(), static_cast<int>(pem.size())));
+  return signing::OpenSSLPointer<X509>(PEM_read_bio_X509(bio.get(), nullptr, nullptr, nullptr));
 }
 
-std::unique_ptr<httplib::Server> makeTLSServer(const station::TLSIdentity& identity) {
+std::unique_ptr<httplib::Server> makeTLSServer(const signing::TLSIdentity& identity) {
   const auto certificate = certificateFromPEM(identity.certificatePEM);
-  const auto key = station::privateKeyFromPEM(identity.keyPEM);
+  const auto key = signing::privateKeyFromPEM(identity.keyPEM);
   return std::make_unique<httplib::SSLServer>(certificate.get(), key.get());
 }
 
@@ -113,7 +113,7 @@ LoopbackServer::LoopbackServer(Handler handler)
     : _implementation(std::make_unique<Implementation>(std::make_unique<httplib::Server>(), "http",
                                                        std::move(handler))) {}
 
-LoopbackServer::LoopbackServer(const station::TLSIdentity& identity, Handler handler)
+LoopbackServer::LoopbackServer(const signing::TLSIdentity& identity, Handler handler)
     : _implementation(
           std::make_unique<Implementation>(makeTLSServer(identity), "https", std::move(handler))) {}
 
@@ -135,7 +135,7 @@ std::size_t LoopbackServer::connectionCount() const {
   return ports.size();
 }
 
-station::TLSIdentity loopbackIdentity(const station::CertificateAuthority& authority) {
+signing::TLSIdentity loopbackIdentity(const signing::CertificateAuthority& authority) {
   return authority.issue({"DNS:localhost", "IP:127.0.0.1"});
 }
 

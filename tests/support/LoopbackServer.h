@@ -9,7 +9,7 @@
 #include <utility>
 #include <vector>
 
-#include "station/CertificateAuthority.h"
+#include "signing/CertificateAuthority.h"
 
 namespace tallyd::test {
 
@@ -45,7 +45,7 @@ class LoopbackServer {
 
   explicit LoopbackServer(Handler handler = {});
   /// With TLS.
-  explicit LoopbackServer(const station::TLSIdentity& identity, Handler handler = {});
+  explicit LoopbackServer(const signing::TLSIdentity& identity, Handler handler = {});
   ~LoopbackServer();
   LoopbackServer(const LoopbackServer&) = delete;
   LoopbackServer& operator=(const LoopbackServer&) = delete;
@@ -66,6 +66,6 @@ class LoopbackServer {
 };
 
 /// A certificate for 127.0.0.1 and localhost.
-[[nodiscard]] station::TLSIdentity loopbackIdentity(const station::CertificateAuthority& authority);
+[[nodiscard]] signing::TLSIdentity loopbackIdentity(const signing::CertificateAuthority& authority);
 
 }  // namespace tallyd::test

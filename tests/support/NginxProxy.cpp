@@ -48,7 +48,7 @@ void writeFile(const std::filesystem::path& path, const std::string& text) { std
 
 }  // namespace
 
-NginxProxy::NginxProxy(const station::TLSIdentity& identity, int upstreamPort) {
+NginxProxy::NginxProxy(const signing::TLSIdentity& identity, int upstreamPort) {
   const platform::FileDescriptor listener = listenOnLoopback();
   _port = portOf(listener.get());
   writeConfiguration(identity, upstreamPort);
@@ -66,7 +66,7 @@ std::string NginxProxy::url(const std::string& path) const {
   return "https://127.0.0.1:" + std::to_string(_port) + path;
 }
 
-void NginxProxy::writeConfiguration(const station::TLSIdentity& identity, int upstreamPort) const {
+void NginxProxy::writeConfiguration(const signing::TLSIdentity& identity, int upstreamPort) const {
   writeFile(_folder.path() / "server.pem", identity.certificatePEM);
   writeFile(_folder.path() / "key.pem", identity.keyPEM);
   writeFile(_folder.path() / "nginx.conf",

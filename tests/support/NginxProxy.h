@@ -7,7 +7,7 @@
 
 #include "fakes/TemporaryFolder.h"
 #include "platform/FileDescriptor.h"
-#include "station/CertificateAuthority.h"
+#include "signing/CertificateAuthority.h"
 
 namespace tallyd::test {
 
@@ -16,7 +16,7 @@ namespace tallyd::test {
 /// object.
 class NginxProxy {
  public:
-  NginxProxy(const station::TLSIdentity& identity, int upstreamPort);
+  NginxProxy(const signing::TLSIdentity& identity, int upstreamPort);
   ~NginxProxy();
   NginxProxy(const NginxProxy&) = delete;
   NginxProxy& operator=(const NginxProxy&) = delete;
@@ -25,7 +25,7 @@ class NginxProxy {
   [[nodiscard]] std::string url(const std::string& path = "/") const;
 
  private:
-  void writeConfiguration(const station::TLSIdentity& identity, int upstreamPort) const;
+  void writeConfiguration(const signing::TLSIdentity& identity, int upstreamPort) const;
   void startProcess(const platform::FileDescriptor& listener);
 
   fakes::TemporaryFolder _folder;

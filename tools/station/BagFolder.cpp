@@ -7,7 +7,7 @@
 
 #include "platform/property-list/PropertyList.h"
 #include "station/Files.h"
-#include "station/StorebagSigning.h"
+#include "signing/StorebagSigning.h"
 
 namespace tallyd::station {
 
@@ -40,7 +40,7 @@ BagFolder::Answer BagFolder::storebag(const std::string& name) const {
     return {404, fmt::format("There is no storebag \"{}\" in {}\n", name, _directory.string())};
   }
   try {
-    return {200, signedStorebag(_key, parseBag(readFile(file)), PropertyListFormat::Binary)};
+    return {200, signing::signedStorebag(_key, parseBag(readFile(file)), PropertyListFormat::Binary)};
   } catch (const std::exception& exception) {
     return {500, fmt::format("{} is not a storebag: {}\n", file.string(), exception.what())};
   }

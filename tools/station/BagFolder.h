@@ -4,7 +4,7 @@
 #include <filesystem>
 #include <string>
 
-#include "station/OpenSSLObjects.h"
+#include "signing/OpenSSLObjects.h"
 
 namespace tallyd::station {
 

@@ -6,9 +6,9 @@
 #include <array>
 #include <stdexcept>
 
-#include "station/CertificateAuthority.h"
+#include "signing/CertificateAuthority.h"
 #include "station/Files.h"
-#include "station/StorebagSigning.h"
+#include "signing/StorebagSigning.h"
 
 namespace tallyd::station {
 
@@ -17,9 +17,9 @@ namespace {
 constexpr mode_t kPublic = 0644;
 constexpr mode_t kPrivate = 0600;
 
-OpenSSLPointer<EVP_PKEY> readStorebagKey(const std::filesystem::path& file) {
+signing::OpenSSLPointer<EVP_PKEY> readStorebagKey(const std::filesystem::path& file) {
   try {
-    auto key = privateKeyFromPEM(readFile(file));
+    auto key = signing::privateKeyFromPEM(readFile(file));
     if (EVP_PKEY_get_base_id(key.get()) != EVP_PKEY_RSA) throw std::runtime_error("not an RSA key");
     return key;
   } catch (const std::system_error&) {
@@ -40,11 +40,11 @@ StationIdentity::StationIdentity(const std::filesystem::path& directory)
 
 void StationIdentity::prepareStorebagKey(const std::filesystem::path& directory) {
   const std::filesystem::path file = directory / "storebag-key.pem";
-  if (!std::filesystem::exists(file)) replaceFile(file, privateKeyPEM(makeStorebagKey().get()), kPrivate);
+  if (!std::filesystem::exists(file)) replaceFile(file, signing::privateKeyPEM(signing::makeStorebagKey().get()), kPrivate);
   _storebagKey = readStorebagKey(file);
 
   const std::filesystem::path publicFile = directory / "publicKey.der";
-  const std::string der = publicKeyDER(_storebagKey.get());
+  const std::string der = signing::publicKeyDER(_storebagKey.get());
   if (!std::filesystem::exists(publicFile) || readFile(publicFile) != der)
     replaceFile(publicFile, der, kPublic);
 }
@@ -59,8 +59,8 @@ void StationIdentity::prepareCertificate(const std::filesystem::path& directory)
     throw std::runtime_error(fmt::format("{} is missing; remove {} and its like too, to have new ones made",
                                          missing->string(), present->filename().string()));
   }
-  const CertificateAuthority authority("tally-station");
-  const TLSIdentity server = authority.issue({"DNS:localhost", "IP:127.0.0.1", "IP:::1"});
+  const signing::CertificateAuthority authority("tally-station");
+  const signing::TLSIdentity server = authority.issue({"DNS:localhost", "IP:127.0.0.1", "IP:::1"});
   replaceFile(authorityFile, authority.certificatePEM(), kPublic);
   replaceFile(_certificateFile, server.certificatePEM, kPublic);
   replaceFile(_certificateKeyFile, server.keyPEM, kPrivate);

@@ -3,7 +3,7 @@
 
 #include <filesystem>
 
-#include "station/OpenSSLObjects.h"
+#include "signing/OpenSSLObjects.h"
 
 namespace tallyd::station {
 
@@ -30,7 +30,7 @@ class StationIdentity {
   void prepareStorebagKey(const std::filesystem::path& directory);
   void prepareCertificate(const std::filesystem::path& directory) const;
 
-  OpenSSLPointer<EVP_PKEY> _storebagKey;
+  signing::OpenSSLPointer<EVP_PKEY> _storebagKey;
   std::filesystem::path _certificateFile;
   std::filesystem::path _certificateKeyFile;
 };

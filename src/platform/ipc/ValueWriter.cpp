@@ -7,8 +7,8 @@
 #include <cstring>
 #include <limits>
 
+#include "platform/UTF8.h"
 #include "platform/ipc/ValueReader.h"
-#include "platform/text/UnicodeText.h"
 
 namespace tallyd::platform {
 
@@ -24,7 +24,7 @@ bool isPlainText(std::string_view text) {
 }
 
 std::string carriableText(std::string_view text) {
-  std::string wellFormed = wellFormedUTF8(text);
+  std::string wellFormed = withBrokenUTF8Replaced(text);
   for (std::size_t nul = 0; (nul = wellFormed.find('\0', nul)) != std::string::npos;) {
     wellFormed.replace(nul, 1, "\xEF\xBF\xBD");
   }

@@ -71,7 +71,7 @@ FileDescriptor FileGrants::open(std::string_view path) {
   std::shared_ptr<const Descriptors> descriptors;
   {
     const std::lock_guard lock(_mutex);
-    const auto consumed = find(_consumed, fmt::format("{}{}", kFileGrantTokenPrefix, path));
+    const auto consumed = find(_consumed, fmt::format("{}{}", kFileTokenPrefix, path));
     if (consumed != _consumed.end()) descriptors = consumed->second.descriptors;
   }
   if (!descriptors || descriptors->empty()) {

@@ -14,9 +14,6 @@
 
 namespace tallyd::platform {
 
-/// Extension tokens of files are this and the file's path.
-inline constexpr std::string_view kFileGrantTokenPrefix = "tally.file:";
-
 /// The grants on offer and those in use. Several clients may offer files under one path, which need not be
 /// the same file; a thread that offers, consumes and opens gets its own.
 ///

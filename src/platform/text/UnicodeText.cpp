@@ -83,8 +83,4 @@ std::size_t utf16Length(std::string_view text) {
   return length;
 }
 
-std::string wellFormedUTF8(std::string_view text) {
-  return isASCII(text) ? std::string(text) : utf8(unicode(text));
-}
-
 }  // namespace tallyd::platform

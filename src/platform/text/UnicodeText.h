@@ -25,7 +25,4 @@ namespace tallyd::platform {
 /// Length in UTF-16 code units.
 [[nodiscard]] std::size_t utf16Length(std::string_view text);
 
-/// `text` with every ill-formed sequence replaced by U+FFFD.
-[[nodiscard]] std::string wellFormedUTF8(std::string_view text);
-
 }  // namespace tallyd::platform

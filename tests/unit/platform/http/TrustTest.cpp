@@ -11,7 +11,7 @@
 
 namespace tallyd::platform {
 
-using station::CertificateAuthority;
+using signing::CertificateAuthority;
 using test::loopbackIdentity;
 using test::LoopbackServer;
 using test::NginxProxy;

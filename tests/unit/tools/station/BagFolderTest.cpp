@@ -7,7 +7,7 @@
 #include "platform/Base64.h"
 #include "platform/property-list/PropertyList.h"
 #include "station/Files.h"
-#include "station/StorebagSigning.h"
+#include "signing/StorebagSigning.h"
 
 namespace tallyd::station {
 
@@ -15,7 +15,7 @@ using testing::HasSubstr;
 
 class BagFolderTest : public testing::Test {
  protected:
-  static void SetUpTestSuite() { key = makeStorebagKey(); }
+  static void SetUpTestSuite() { key = signing::makeStorebagKey(); }
   static void TearDownTestSuite() { key.reset(); }
 
   void writeBag(const std::string& name, const std::string& text) const {
@@ -32,7 +32,7 @@ class BagFolderTest : public testing::Test {
     return std::string(bag->dictionary()->string("version").value_or("no version"));
   }
 
-  static inline OpenSSLPointer<EVP_PKEY> key;
+  static inline signing::OpenSSLPointer<EVP_PKEY> key;
   fakes::TemporaryFolder folder;
   const BagFolder bags{folder.path(), key.get()};
 };

@@ -10,7 +10,7 @@
 
 #include "fakes/TemporaryFolder.h"
 #include "station/Files.h"
-#include "station/StorebagSigning.h"
+#include "signing/StorebagSigning.h"
 
 namespace tallyd::station {
 
@@ -18,10 +18,10 @@ using testing::HasSubstr;
 
 namespace {
 
-OpenSSLPointer<X509> readCertificate(const std::filesystem::path& file) {
+signing::OpenSSLPointer<X509> readCertificate(const std::filesystem::path& file) {
   const std::string pem = readFile(file);
-  const OpenSSLPointer<BIO> bio(BIO_new_mem_buf(pem.data(), static_cast<int>(pem.size())));
-  return OpenSSLPointer<X509>(PEM_read_bio_X509(bio.get(), nullptr, nullptr, nullptr));
+  const signing::OpenSSLPointer<BIO> bio(BIO_new_mem_buf(pem.data(), static_cast<int>(pem.size())));
+  return signing::OpenSSLPointer<X509>(PEM_read_bio_X509(bio.get(), nullptr, nullptr, nullptr));
 }
 
 mode_t modeOf(const std::filesystem::path& file) {
@@ -61,7 +61,7 @@ TEST_F(StationIdentityTest, MakesKeysAndCertificatesAndKeepsThem) {
   EXPECT_EQ(files.size(), 5U);
   const StationIdentity identity(directory);
   EXPECT_EQ(contents(), files);
-  EXPECT_EQ(publicKeyDER(identity.storebagKey()), files.at("publicKey.der"));
+  EXPECT_EQ(signing::publicKeyDER(identity.storebagKey()), files.at("publicKey.der"));
 }
 
 TEST_F(StationIdentityTest, LetsOnlyTheOwnerReadPrivateKeys) {
@@ -82,7 +82,7 @@ TEST_F(StationIdentityTest, CertifiesTheLoopbackNamesUnderItsAuthority) {
   EXPECT_EQ(X509_check_ip_asc(server.get(), "::1", 0), 1);
   EXPECT_NE(X509_check_host(server.get(), "storebags.quillon.example", 0, 0, nullptr), 1);
   EXPECT_EQ(
-      X509_check_private_key(server.get(), privateKeyFromPEM(readFile(identity.certificateKeyFile())).get()),
+      X509_check_private_key(server.get(), signing::privateKeyFromPEM(readFile(identity.certificateKeyFile())).get()),
       1);
 }
 

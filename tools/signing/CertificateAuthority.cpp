@@ -1,4 +1,4 @@
-#include "station/CertificateAuthority.h"
+#include "signing/CertificateAuthority.h"
 
 #include <openssl/ec.h>
 #include <openssl/rand.h>
@@ -6,7 +6,7 @@
 
 #include <cstdint>
 
-namespace tallyd::station {
+namespace tallyd::signing {
 
 namespace {
 
@@ -70,7 +70,7 @@ CertificateAuthority::CertificateAuthority(const std::string& commonName)
   addExtension(_certificate.get(), _certificate.get(), NID_basic_constraints, "critical,CA:TRUE,pathlen:0");
   addExtension(_certificate.get(), _certificate.get(), NID_key_usage, "critical,keyCertSign,cRLSign");
   sign(_certificate.get(), _certificate.get(), _key.get());
-  _certificatePEM = station::certificatePEM(_certificate.get());
+  _certificatePEM = signing::certificatePEM(_certificate.get());
 }
 
 TLSIdentity CertificateAuthority::issue(const std::vector<std::string>& subjectAltNames) const {
@@ -85,7 +85,7 @@ TLSIdentity CertificateAuthority::issue(const std::vector<std::string>& subjectA
   addExtension(certificate.get(), _certificate.get(), NID_ext_key_usage, "serverAuth");
   addExtension(certificate.get(), _certificate.get(), NID_subject_alt_name, names);
   sign(certificate.get(), _certificate.get(), _key.get());
-  return {station::certificatePEM(certificate.get()), privateKeyPEM(key.get())};
+  return {signing::certificatePEM(certificate.get()), privateKeyPEM(key.get())};
 }
 
-}  // namespace tallyd::station
+}  // namespace tallyd::signing

@@ -1,4 +1,4 @@
-#include "station/StorebagSigning.h"
+#include "signing/StorebagSigning.h"
 
 #include <gtest/gtest.h>
 #include <openssl/rsa.h>
@@ -8,7 +8,7 @@
 
 #include "platform/Base64.h"
 
-namespace tallyd::station {
+namespace tallyd::signing {
 
 using platform::Dictionary;
 using platform::PropertyListFormat;
@@ -64,4 +64,4 @@ TEST(StorebagSigningTest, RefusesABagThatNoPropertyListHolds) {
       std::runtime_error);
 }
 
-}  // namespace tallyd::station
+}  // namespace tallyd::signing

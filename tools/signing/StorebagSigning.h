@@ -6,9 +6,9 @@
 
 #include "platform/Value.h"
 #include "platform/property-list/PropertyList.h"
-#include "station/OpenSSLObjects.h"
+#include "signing/OpenSSLObjects.h"
 
-namespace tallyd::station {
+namespace tallyd::signing {
 
 /// A new RSA key of 2048 bits; throws.
 [[nodiscard]] OpenSSLPointer<EVP_PKEY> makeStorebagKey();
@@ -26,4 +26,4 @@ namespace tallyd::station {
 [[nodiscard]] std::string signedStorebag(EVP_PKEY* key, const platform::Value& bag,
                                          platform::PropertyListFormat format);
 
-}  // namespace tallyd::station
+}  // namespace tallyd::signing

@@ -9,7 +9,7 @@
 #include <string>
 #include <string_view>
 
-namespace tallyd::station {
+namespace tallyd::signing {
 
 struct OpenSSLDeleter {
   void operator()(BIO* object) const { BIO_free(object); }
@@ -30,4 +30,4 @@ void requireOpenSSL(bool succeeded, const char* what);
 /// A certificate as PEM; throws.
 [[nodiscard]] std::string certificatePEM(X509* certificate);
 
-}  // namespace tallyd::station
+}  // namespace tallyd::signing

@@ -1,4 +1,4 @@
-#include "station/StorebagSigning.h"
+#include "signing/StorebagSigning.h"
 
 #include <openssl/rsa.h>
 
@@ -6,7 +6,7 @@
 
 #include "platform/Base64.h"
 
-namespace tallyd::station {
+namespace tallyd::signing {
 
 using platform::base64Encoded;
 using platform::Dictionary;
@@ -64,4 +64,4 @@ std::string signedStorebag(EVP_PKEY* key, const Value& bag, PropertyListFormat f
   return written(envelope, PropertyListFormat::XML);
 }
 
-}  // namespace tallyd::station
+}  // namespace tallyd::signing

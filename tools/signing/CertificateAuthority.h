@@ -4,9 +4,9 @@
 #include <string>
 #include <vector>
 
-#include "station/OpenSSLObjects.h"
+#include "signing/OpenSSLObjects.h"
 
-namespace tallyd::station {
+namespace tallyd::signing {
 
 /// A server's certificate and private key, both PEM.
 struct TLSIdentity {
@@ -34,4 +34,4 @@ class CertificateAuthority {
   std::string _certificatePEM;
 };
 
-}  // namespace tallyd::station
+}  // namespace tallyd::signing

@@ -1,11 +1,11 @@
-#include "station/OpenSSLObjects.h"
+#include "signing/OpenSSLObjects.h"
 
 #include <openssl/err.h>
 #include <openssl/pem.h>
 
 #include <stdexcept>
 
-namespace tallyd::station {
+namespace tallyd::signing {
 
 namespace {
 
@@ -53,4 +53,4 @@ std::string certificatePEM(X509* certificate) {
   return contents(bio.get());
 }
 
-}  // namespace tallyd::station
+}  // namespace tallyd::signing
