@@ -7,11 +7,11 @@
 #include <deque>
 #include <filesystem>
 #include <functional>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <optional>
 #include <string>
-#include <unordered_map>
 #include <vector>
 
 #include "platform/IPC.h"
@@ -26,9 +26,17 @@ namespace tallyd::platform {
 /// is. Threading: any thread; close() not on the connection's queue.
 class SdBusClientConnection final : public BusConnection {
  public:
+  enum class Outcome {
+    Answered,
+    Rejected,      ///< The service answered with an error, or with results of other types.
+    NotSent,       ///< The arguments do not fit the method.
+    TimedOut,      ///< No answer in time; the service may have heard the call, or hear it still.
+    Disconnected,  ///< The connection ended first; the service may have heard the call.
+  };
   struct Reply {
     std::optional<std::string> error;  ///< Why there are no results.
     std::vector<Value> results;
+    Outcome outcome = Outcome::Answered;
   };
   using Completion = std::function<void(Reply reply)>;
 
@@ -42,6 +50,12 @@ class SdBusClientConnection final : public BusConnection {
   static std::shared_ptr<SdBusClientConnection> connect(const std::filesystem::path& socketPath,
                                                         const Interface& interface, Queues& queues);
 
+  /// A socket that is connected to the service's. Waits up to `patience` while the service is too busy to
+  /// take it (zero: not at all). Throws std::system_error that names the path.
+  static FileDescriptor connectedSocket(const std::filesystem::path& path,
+                                        std::chrono::milliseconds patience);
+
+  /// Borrows the interface; start() begins.
   SdBusClientConnection(FileDescriptor socket, const Interface& interface,
                         std::shared_ptr<SerialQueue> queue);
   ~SdBusClientConnection();
@@ -51,12 +65,23 @@ class SdBusClientConnection final : public BusConnection {
   /// Called once, when the connection has ended by itself; at once when it has already.
   void setInvalidationHandler(std::function<void()> handler);
 
-  /// An empty completion asks for no answer.
+  /// An empty completion asks for no answer. The timeout counts from the time when the call leaves.
   void call(Request request, std::chrono::milliseconds timeout, Completion completion);
 
   /// Sends what has been called, lets the service hear and answer it, and closes, all within `patience`;
   /// calls that have no answer then fail.
   void close(std::chrono::milliseconds patience);
+
+  // For an owner that works on the connection's queue and keeps waiting calls itself. All on the queue.
+
+  using BusConnection::start;
+  /// `ready` runs whenever a call would leave at once, first when authentication is over; it returns whether
+  /// it made one. `ended` runs last, also after finish() and abort(). Before the start.
+  void setOwner(std::function<bool()> ready, std::function<void(bool withinMessage)> ended);
+  [[nodiscard]] bool isReady() const;
+  void callNow(Request request, std::chrono::milliseconds timeout, Completion completion);
+  void finish();  ///< As close(), without waiting for it.
+  void abort();   ///< Ends at once; what has no answer fails.
 
  private:
   struct Pending;
@@ -75,11 +100,13 @@ class SdBusClientConnection final : public BusConnection {
   void send(Waiting call);
   bool sendWaiting();
   static int handleReply(sd_bus_message* message, void* pending, void* error) noexcept;
-  void finish(std::uint64_t number, Reply reply);
+  [[nodiscard]] Reply failedReply(const char* name, const char* message,
+                                  std::chrono::milliseconds timeout) const;
+  void complete(std::uint64_t number, Reply reply);
 
   const Interface& _interface;
   std::deque<Waiting> _waiting;  ///< Until authentication is over, and while the library's queue is full.
-  std::unordered_map<std::uint64_t, std::unique_ptr<Pending>> _pending;
+  std::map<std::uint64_t, std::unique_ptr<Pending>> _pending;  ///< In the order of the calls.
   std::uint64_t _lastNumber = 0;
   bool _brokeOff = false;  ///< Ended while nobody was closing it.
   bool _over = false;
@@ -87,6 +114,8 @@ class SdBusClientConnection final : public BusConnection {
   bool _halfClosed = false;
   std::function<void()> _interruptionHandler;
   std::function<void()> _invalidationHandler;
+  std::function<bool()> _ownerReady;
+  std::function<void(bool withinMessage)> _ownerEnded;
 
   std::mutex _closedMutex;
   std::condition_variable _closedChanged;

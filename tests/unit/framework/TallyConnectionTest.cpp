@@ -1,22 +1,16 @@
 #include "framework/TallyConnection.h"
 
-#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
-#include <array>
 #include <condition_variable>
 #include <fstream>
-#include <functional>
 #include <mutex>
 #include <system_error>
 #include <utility>
 
-#include "fakes/FakeLog.h"
 #include "fakes/TemporaryFolder.h"
-#include "framework/ClientSessionInterface.h"
-#include "platform/ipc/SdBusListener.h"
-#include "platform/queues/AsioQueues.h"
+#include "unit/framework/ScriptedDaemon.h"
 
 namespace tallyd {
 namespace {
@@ -27,86 +21,6 @@ using platform::Date;
 using platform::Dictionary;
 using platform::FileDescriptor;
 using platform::Value;
-
-struct ReceivedCall {
-  ClientSessionMethod method;
-  std::vector<Value> arguments;
-  std::vector<ino_t> files;
-  bool expectsReply = false;
-};
-
-/// A daemon that keeps each call and answers what the test has set.
-class ScriptedDaemon final : public platform::ListenerDelegate {
- public:
-  explicit ScriptedDaemon(const std::filesystem::path& socketPath) : _listener(socketPath, _queues, _log) {
-    _listener.setDelegate(*this);
-    _listener.resume();
-  }
-
-  void answerWith(std::vector<Value> results) {
-    const std::lock_guard lock(_mutex);
-    _answer = std::move(results);
-  }
-  void answerNothing() {
-    const std::lock_guard lock(_mutex);
-    _answer.reset();
-  }
-  /// The calls received, once there are `count` of them.
-  std::vector<ReceivedCall> calls(std::size_t count) {
-    std::unique_lock lock(_mutex);
-    EXPECT_TRUE(_changed.wait_for(lock, std::chrono::seconds(30), [&] { return _calls.size() >= count; }));
-    return _calls;
-  }
-  bool waitForInvalidation() {
-    std::unique_lock lock(_mutex);
-    return _changed.wait_for(lock, std::chrono::seconds(30), [&] { return _invalidated; });
-  }
-
-  bool shouldAcceptNewConnection(const std::shared_ptr<platform::ServiceConnection>& connection) override {
-    connection->setExportedInterface(clientSessionInterface());
-    connection->setExportedObject(std::make_shared<Session>(*this));
-    connection->setInvalidationHandler([this] {
-      const std::lock_guard lock(_mutex);
-      _invalidated = true;
-      _changed.notify_all();
-    });
-    connection->resume();
-    return true;
-  }
-
- private:
-  class Session final : public platform::ExportedObject {
-   public:
-    explicit Session(ScriptedDaemon& daemon) : _daemon(daemon) {}
-    void handleCall(const std::shared_ptr<platform::IncomingCall>& call) override { _daemon.receive(*call); }
-
-   private:
-    ScriptedDaemon& _daemon;
-  };
-
-  void receive(platform::IncomingCall& call) {
-    const std::lock_guard lock(_mutex);
-    ReceivedCall received{
-        static_cast<ClientSessionMethod>(call.methodIndex()), call.arguments(), {}, call.expectsReply()};
-    for (const auto& file : call.descriptors()) {
-      struct stat status {};
-      EXPECT_EQ(::fstat(file.get(), &status), 0);
-      received.files.push_back(status.st_ino);
-    }
-    _calls.push_back(std::move(received));
-    _changed.notify_all();
-    if (_answer) call.reply(*_answer);
-  }
-
-  std::mutex _mutex;
-  std::condition_variable _changed;
-  std::vector<ReceivedCall> _calls;
-  std::optional<std::vector<Value>> _answer;
-  bool _invalidated = false;
-  fakes::FakeLog _log;
-  platform::AsioQueues _queues{2};
-  platform::SdBusListener _listener;
-};
 
 class TallyConnectionTest : public testing::Test {
  protected:
