@@ -54,12 +54,19 @@ TallyBackend::Result TallyBackend::sendMessage(const Payload& payload, const tim
 
 TallyBackend::Result TallyBackend::sendMessage(const Payload&, const timeval&, std::uint16_t, std::uint16_t,
                                                std::uint16_t) {
+  _account->passBy();
   return std::nullopt;
 }
 
-bool TallyBackend::uploadFileAtPath(std::string_view, std::string_view) { return false; }
+bool TallyBackend::uploadFileAtPath(std::string_view, std::string_view) {
+  _account->passBy();
+  return false;
+}
 
-bool TallyBackend::uploadLogData(const platform::Array&) { return false; }
+bool TallyBackend::uploadLogData(const platform::Array&) {
+  _account->passBy();
+  return false;
+}
 
 double secondsFromTimeval(const timeval& time) {
   return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_usec) / 1'000'000;

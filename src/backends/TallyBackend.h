@@ -11,6 +11,7 @@
 #include <string_view>
 
 #include "platform/Value.h"
+#include "support/Account.h"
 
 namespace tallyd::platform {
 struct Platform;
@@ -55,6 +56,14 @@ class TallyBackend {
   /// SHA-256 (FIPS 180-4) in lower-case hexadecimal over as many of the text's UTF-8 bytes as the text has
   /// UTF-16 units: the receiving side counts the same way.
   [[nodiscard]] static std::string convertIntoSHA256(std::string_view text);
+
+  /// What the daemon's books call backends of this class, such as "https-post".
+  [[nodiscard]] virtual std::string_view kind() const { return "other"; }
+  /// Where this backend books what it takes and what becomes of it; one of its own unless set. Everything
+  /// that is given to the backend ends in exactly one place of the account.
+  [[nodiscard]] Account& account() const { return *_account; }
+  /// Before the first message.
+  virtual void setAccount(std::shared_ptr<Account> account) { _account = std::move(account); }
 
   /// Called once, before the session drops the backend.
   virtual void cleanup() {}
@@ -127,6 +136,7 @@ class TallyBackend {
                std::optional<std::string> productFamily);
 
   const platform::Platform& _platform;
+  std::shared_ptr<Account> _account = std::make_shared<Account>();
   const Payload _profile;
   const std::string _name;
   std::int32_t _state = ReportingStatePending;

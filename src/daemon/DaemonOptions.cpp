@@ -12,6 +12,7 @@ Example, in a folder of one's own and without a service manager:
 
 Files, below the root:
   run/tallyd/com.quillon.tallyd           the socket that clients connect to
+  run/tallyd/com.quillon.tallyd.inspection  the socket of "tallyctl stats" and "tallyctl tap"
   etc/tally/preferences/NAME.plist        preferences
   usr/share/tally/sandbox/                the sandbox's profile
 

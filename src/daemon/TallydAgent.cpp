@@ -40,8 +40,8 @@ std::string correlationKeyForUserInfo(const std::optional<platform::Dictionary>&
   return name(kTallyUserInfoClientName) + ":" + name(kTallyUserInfoServiceName);
 }
 
-TallydAgent::TallydAgent(const platform::Platform& platform)
-    : _platform(platform), _messageLog(platform), _cachedStorebags(platform) {}
+TallydAgent::TallydAgent(const platform::Platform& platform, std::shared_ptr<Ledger> ledger)
+    : _platform(platform), _ledger(std::move(ledger)), _messageLog(platform), _cachedStorebags(platform) {}
 
 TallydAgent::~TallydAgent() = default;
 
@@ -49,7 +49,9 @@ bool TallydAgent::shouldAcceptNewConnection(const std::shared_ptr<platform::Serv
   const auto [sessions, groups] = counts();
   asl_log(_platform.log, LogLevel::Debug, "Accepting new XPC connection {}, {}({}) connections.",
           connection->description(), sessions, groups);
-  const auto session = std::make_shared<TallydSession>(*this, _platform, _messageLog);
+  _ledger->connectionAccepted();
+  const auto session = std::make_shared<TallydSession>(*this, _platform, _messageLog,
+                                                       TallyBackend::newBackendWithName, _ledger->openBook());
   connection->setExportedInterface(clientSessionInterface());
   connection->setExportedObject(std::make_shared<ClientSessionExport>(session, _platform.sandbox));
   {
@@ -71,6 +73,7 @@ std::pair<std::size_t, std::size_t> TallydAgent::counts() {
 
 void TallydAgent::connectionInvalidated(const std::shared_ptr<TallydSession>& session) {
   asl_log(_platform.log, LogLevel::Debug, "XPC connection to {} was invalidated", session->description());
+  _ledger->connectionEnded();
   const std::string key = correlationKeyForUserInfo(session->userInfo());
   // The caller holds the session: no reference that goes here is the last.
   const std::lock_guard lock(_mutex);

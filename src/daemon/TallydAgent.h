@@ -12,6 +12,7 @@
 #include "platform/IPC.h"
 #include "session/TallydSessionDelegate.h"
 #include "storebag/StorebagCache.h"
+#include "support/Ledger.h"
 #include "support/MessageLog.h"
 
 namespace tallyd {
@@ -25,8 +26,9 @@ namespace tallyd {
 /// of a session only its hierarchy and combined ID are read, each under the session's own lock.
 class TallydAgent final : public platform::ListenerDelegate, public TallydSessionDelegate {
  public:
-  /// Borrows the platform.
-  explicit TallydAgent(const platform::Platform& platform);
+  /// Borrows the platform. `ledger` gets a book for every session.
+  explicit TallydAgent(const platform::Platform& platform,
+                       std::shared_ptr<Ledger> ledger = std::make_shared<Ledger>());
   ~TallydAgent() override;
 
   bool shouldAcceptNewConnection(const std::shared_ptr<platform::ServiceConnection>& connection) override;
@@ -53,6 +55,7 @@ class TallydAgent final : public platform::ListenerDelegate, public TallydSessio
   void connectionInvalidated(const std::shared_ptr<TallydSession>& session);
 
   const platform::Platform& _platform;
+  const std::shared_ptr<Ledger> _ledger;
   MessageLog _messageLog;
   StorebagCache _cachedStorebags;
   std::mutex _mutex;

@@ -7,9 +7,11 @@
 #include <csignal>
 
 #include "daemon/DaemonOptions.h"
+#include "daemon/InspectionService.h"
 #include "daemon/ProductionPlatform.h"
 #include "daemon/TallydAgent.h"
 #include "framework/ClientSessionInterface.h"
+#include "framework/InspectionInterface.h"
 #include "framework/TallyLogging.h"
 #include "platform/ipc/SdBusListener.h"
 #include "platform/sandbox/LinuxSandbox.h"
@@ -45,6 +47,20 @@ void reportFailedStart(tallyd::platform::Log& log, const tallyd::DaemonOptions& 
   }
 }
 
+/// The inspection service's own socket; null, after a warning, where it can't be had: the daemon does its
+/// work without it.
+std::unique_ptr<tallyd::platform::SdBusListener> makeInspectionListener(
+    const tallyd::platform::Root& root, const tallyd::platform::Platform& platform) {
+  try {
+    return std::make_unique<tallyd::platform::SdBusListener>(tallyd::inspectionSocketPath(root),
+                                                             platform.queues, platform.log,
+                                                             tallyd::platform::SocketAccess::OwnersOnly);
+  } catch (const std::exception& error) {
+    asl_log(platform.log, LogLevel::Warning, "Running without inspection: {}", error.what());
+    return nullptr;
+  }
+}
+
 int serve(const tallyd::DaemonOptions& options, const tallyd::platform::Root& root,
           tallyd::platform::Log& log, const tallyd::platform::Clock& clock,
           tallyd::platform::Sandbox& sandbox) {
@@ -57,7 +73,15 @@ int serve(const tallyd::DaemonOptions& options, const tallyd::platform::Root& ro
   const tallyd::ProductionPlatform production(root, log, clock, sandbox);
   const tallyd::platform::Platform& platform = production.platform();
   tallyd::platform::SdBusListener listener(tallyd::tallydSocketPath(root), platform.queues, log);
-  tallyd::TallydAgent agent(platform);
+  const auto tap = std::make_shared<tallyd::Tap>(platform.queues, clock);
+  const auto ledger = std::make_shared<tallyd::Ledger>(tap);
+  tallyd::TallydAgent agent(platform, ledger);
+  tallyd::InspectionService inspection(log, *ledger, *tap, geteuid());
+  const auto inspectionListener = makeInspectionListener(root, platform);
+  if (inspectionListener) {
+    inspectionListener->setDelegate(inspection);
+    inspectionListener->resume();
+  }
   listener.setDelegate(agent);
   listener.resume();
   asl_log(log, LogLevel::Info, "Listener resumes with sandbox, start loop.");

@@ -40,11 +40,17 @@ struct HTTPResponse {
   [[nodiscard]] std::optional<std::string> header(std::string_view name) const;
 };
 
+enum class HTTPFailure {
+  Transfer,      ///< The request, or the way to its response, failed.
+  TooMuchWaits,  ///< Nothing was tried: unfinished requests hold as much as they may.
+};
+
 /// What became of a request: an error, or a response and its body, which may be empty.
 struct HTTPResult {
   std::optional<std::string> error;  ///< What went wrong, with the URL's host.
   std::optional<HTTPResponse> response;
   Data data;
+  HTTPFailure failure = HTTPFailure::Transfer;  ///< Of what kind the error is.
 };
 
 /// Follows at most 10 redirects, within http and https only; trusts the system's certificate authorities and

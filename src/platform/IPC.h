@@ -1,8 +1,11 @@
 // Inter-process communication: a named service, its connections, and the calls that arrive on them.
 #pragma once
 
+#include <sys/types.h>
+
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -67,6 +70,8 @@ class ServiceConnection {
   virtual ~ServiceConnection() = default;
 
   [[nodiscard]] virtual std::string description() const = 0;  ///< Which client: its process and user number.
+  /// The user of the process that connected, as the system vouches for it; nothing when it can't tell.
+  [[nodiscard]] virtual std::optional<uid_t> peerUser() const { return std::nullopt; }
   /// Borrows the interface; it must outlive every connection.
   virtual void setExportedInterface(const Interface& exported) = 0;
   virtual void setExportedObject(std::shared_ptr<ExportedObject> object) = 0;

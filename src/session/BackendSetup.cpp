@@ -6,6 +6,7 @@
 #include "platform/Log.h"
 #include "platform/Platform.h"
 #include "support/DeviceIdentity.h"
+#include "support/SessionBook.h"
 
 namespace tallyd {
 
@@ -65,7 +66,8 @@ std::optional<BackendSet> createBackendsFromStorebag(const platform::Platform& p
                                                      const std::optional<Dictionary>& storebag,
                                                      const std::optional<Dictionary>& sessionInfo,
                                                      const std::optional<Dictionary>& userInfo,
-                                                     const char* deviceID, const BackendFactory& newBackend) {
+                                                     const char* deviceID, const BackendFactory& newBackend,
+                                                     SessionBook* book) {
   if (!storebag) {
     asl_log(platform.log, LogLevel::Critical, "Attempted to create backends with nil storebag");
     return std::nullopt;
@@ -96,6 +98,7 @@ std::optional<BackendSet> createBackendsFromStorebag(const platform::Platform& p
         newBackend(platform, entry.key, profileOf(platform, entry), productFamily, identity.clientType);
     if (!backend) continue;
     stamp(*backend, identity);
+    if (book) backend->setAccount(book->openAccount(entry.key, backend->kind()));
     backends.emplace(entry.key, std::move(backend));
   }
   return backends;

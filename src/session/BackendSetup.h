@@ -14,6 +14,8 @@
 
 namespace tallyd {
 
+class SessionBook;
+
 /// Makes the backend that a storebag's entry asks for, or none: TallyBackend::newBackendWithName, unless a
 /// test brings backends of its own.
 using BackendFactory = std::function<std::shared_ptr<TallyBackend>(
@@ -27,11 +29,11 @@ using BackendSet = std::map<std::string, std::shared_ptr<TallyBackend>, std::les
 /// the device's identity. Nothing, after a line in the log, without a storebag or session info.
 ///
 /// The backends borrow the platform and keep the pointer `deviceID`, a terminated text: both must outlive
-/// them.
+/// them. Each backend gets an account of its own in `book`, if there is one.
 [[nodiscard]] std::optional<BackendSet> createBackendsFromStorebag(
     const platform::Platform& platform, const std::optional<platform::Dictionary>& storebag,
     const std::optional<platform::Dictionary>& sessionInfo,
     const std::optional<platform::Dictionary>& userInfo, const char* deviceID,
-    const BackendFactory& newBackend = TallyBackend::newBackendWithName);
+    const BackendFactory& newBackend = TallyBackend::newBackendWithName, SessionBook* book = nullptr);
 
 }  // namespace tallyd

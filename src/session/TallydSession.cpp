@@ -9,6 +9,7 @@
 #include "platform/Platform.h"
 #include "platform/Randomness.h"
 #include "session/TallydSessionDelegate.h"
+#include "support/SessionBook.h"
 
 namespace tallyd {
 
@@ -35,10 +36,12 @@ std::uint32_t sessionIDOf(const TallydSession::Info& sessionInfo) {
 }  // namespace
 
 TallydSession::TallydSession(TallydSessionDelegate& sessionDelegate, const platform::Platform& platform,
-                             MessageLog& messageLog, BackendFactory newBackend)
+                             MessageLog& messageLog, BackendFactory newBackend,
+                             std::shared_ptr<SessionBook> book)
     : _platform(platform),
       _messageLog(messageLog),
       _newBackend(std::move(newBackend)),
+      _book(book ? std::move(book) : std::make_shared<SessionBook>()),
       _sessionDelegate(sessionDelegate) {
   asl_log(_platform.log, LogLevel::Debug, "TallydSession initWithSessionDelegate:{}",
           sessionDelegate.description());
@@ -117,6 +120,7 @@ void TallydSession::sendMessageWithSessionInfo(const Info& sessionInfo, const In
   if (!sessionInfo || !sessionInfo->contains(kTallySessionInfoClientType) ||
       !sessionInfo->contains(kTallySessionInfoSessionID)) {
     asl_log(_platform.log, LogLevel::Critical, "Could not retrieve identifiers from sessionInfo");
+    _book->messages().dropNew(DropReason::NoSessionInfo, 1, MessageNumbers{category});
     return;
   }
   setSessionID(sessionIDOf(sessionInfo));
@@ -126,7 +130,9 @@ void TallydSession::sendMessageWithSessionInfo(const Info& sessionInfo, const In
   const auto storebag = _sessionDelegate.storebagForSession(*this);
   if (storebag) {
     sendMessageWithSessionInfo(_platform, _messageLog, sessionInfo, userInfo, storebag, category, type,
-                               payload, _newBackend);
+                               payload, _newBackend, _book.get());
+  } else {
+    _book->messages().dropNew(DropReason::NoStorebag, 1, MessageNumbers{category});
   }
   if (reply) reply(storebag ? "finished" : "storebag not available");
 }
@@ -135,8 +141,8 @@ void TallydSession::createBackendsWithStorebag(const Dictionary& storebag) {
   asl_log(_platform.log, LogLevel::Debug, "Creating backends for session {}", sessionID());
   const timeval now = _platform.clock.timeOfDay();
   const Info startRecord = startRecordPayload();
-  auto created =
-      createBackendsFromStorebag(_platform, storebag, _sessionInfo, _userInfo, _deviceid.data(), _newBackend);
+  auto created = createBackendsFromStorebag(_platform, storebag, _sessionInfo, _userInfo, _deviceid.data(),
+                                            _newBackend, _book.get());
   const SharedBackends backends = created ? std::make_shared<const BackendSet>(std::move(*created)) : nullptr;
   _backends.set(backends);
   if (backends) {
@@ -144,6 +150,12 @@ void TallydSession::createBackendsWithStorebag(const Dictionary& storebag) {
       backend->setCombinedSessionIDString(combinedSessionIDString());
   }
   internalSendMessage(startRecord, now, kInternalMethod, kSessionStart);
+}
+
+void TallydSession::describeInBook() const {
+  const auto clientType = _sessionInfo ? _sessionInfo->integer(kTallySessionInfoClientType) : std::nullopt;
+  const auto clientName = _userInfo ? _userInfo->string(kTallyUserInfoClientName) : std::nullopt;
+  _book->describe(sessionID(), static_cast<std::int32_t>(clientType.value_or(0)), clientName.value_or(""));
 }
 
 TallydSession::Info TallydSession::startRecordPayload() const {

@@ -19,6 +19,7 @@ struct timeval;
 namespace tallyd {
 
 class MessageLog;
+class SessionBook;
 class TallydSessionDelegate;
 
 /// Keeps a client's session info, owns the backends that its storebag makes, and hands every message to all
@@ -38,9 +39,11 @@ class TallydSession : public std::enable_shared_from_this<TallydSession> {
   template <class... Arguments>
   using Reply = std::function<void(Arguments...)>;
 
-  /// Borrows the delegate, the platform and the message log; all outlive every session.
+  /// Borrows the delegate, the platform and the message log; all outlive every session. Without a book the
+  /// session keeps one of its own.
   TallydSession(TallydSessionDelegate& sessionDelegate, const platform::Platform& platform,
-                MessageLog& messageLog, BackendFactory newBackend = TallyBackend::newBackendWithName);
+                MessageLog& messageLog, BackendFactory newBackend = TallyBackend::newBackendWithName,
+                std::shared_ptr<SessionBook> book = nullptr);
   ~TallydSession();
   TallydSession(const TallydSession&) = delete;
   TallydSession& operator=(const TallydSession&) = delete;
@@ -80,11 +83,13 @@ class TallydSession : public std::enable_shared_from_this<TallydSession> {
   Result flushMessages();
   void uploadFileWithURL(const std::string& url, const std::string& extensionToken,
                          const Reply<bool>& completionHandler);
-  /// Sends one message through backends of its own that live for this call only.
+  /// Sends one message through backends of its own that live for this call only; their accounts are in
+  /// `book`, if there is one.
   static void sendMessageWithSessionInfo(const platform::Platform& platform, MessageLog& messageLog,
                                          const Info& sessionInfo, const Info& userInfo, const Info& storebag,
                                          std::uint16_t category, std::uint16_t type, const Info& payload,
-                                         const BackendFactory& newBackend = TallyBackend::newBackendWithName);
+                                         const BackendFactory& newBackend = TallyBackend::newBackendWithName,
+                                         SessionBook* book = nullptr);
 
   [[nodiscard]] std::uint32_t sessionID() const { return _sessionID; }
   void setSessionID(std::uint32_t sessionID) { _sessionID = sessionID; }
@@ -97,12 +102,15 @@ class TallydSession : public std::enable_shared_from_this<TallydSession> {
  private:
   using SharedBackends = std::shared_ptr<const BackendSet>;  ///< Null until the session is started.
 
+  /// Tells the book who the session is now.
+  void describeInBook() const;
   bool userInfoChanged(const Dictionary& userInfo) const;
   Info startRecordPayload() const;
 
   const platform::Platform& _platform;
   MessageLog& _messageLog;
   const BackendFactory _newBackend;
+  const std::shared_ptr<SessionBook> _book;
   std::atomic<std::uint32_t> _sessionID = 0;
   Info _sessionInfo;
   Info _userInfo;

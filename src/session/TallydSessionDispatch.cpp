@@ -8,6 +8,7 @@
 #include "session/FileURL.h"
 #include "session/TallydSession.h"
 #include "support/MessageLog.h"
+#include "support/SessionBook.h"
 
 namespace tallyd {
 
@@ -32,11 +33,19 @@ void applyPrecedence(std::optional<std::string>& chosen, const TallyBackend& bac
   }
 }
 
+/// Books a message or an upload that is about to be given to the backends.
+void bookOffer(Account& account, const BackendSet* backends,
+               const std::optional<MessageNumbers>& numbers = {}) {
+  if (backends && !backends->empty()) return account.send();
+  account.dropNew(DropReason::NoBackends, 1, numbers);
+}
+
 }  // namespace
 
 TallydSession::Result TallydSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                              const Info& payload) {
   const auto backends = _backends.copy();
+  bookOffer(_book->messages(), backends.get(), MessageNumbers{category});
   if (!backends) {
     asl_log(_platform.log, LogLevel::Debug, "No backends available to send message");
     return std::nullopt;
@@ -82,7 +91,9 @@ void TallydSession::uploadFileWithURL(const std::string& url, const std::string&
                                       const Reply<bool>& completionHandler) {
   const std::string path = pathOfFileURL(url);
   bool uploaded = false;
-  if (const auto backends = _backends.copy()) {
+  const auto backends = _backends.copy();
+  bookOffer(_book->uploads(), backends.get());
+  if (backends) {
     for (const auto& [name, backend] : *backends) {
       uploaded = backend->uploadFileAtPath(path, extensionToken) || uploaded;
     }
@@ -104,7 +115,9 @@ void TallydSession::uploadLogData(const platform::Array& logData,
             platform::Value(logData).description());
   }
   bool uploaded = false;
-  if (const auto backends = _backends.copy()) {
+  const auto backends = _backends.copy();
+  bookOffer(_book->uploads(), backends.get());
+  if (backends) {
     for (const auto& [name, backend] : *backends) uploaded = backend->uploadLogData(logData) || uploaded;
   }
   if (uploaded) {
@@ -119,7 +132,7 @@ void TallydSession::sendMessageWithSessionInfo(const platform::Platform& platfor
                                                const Info& sessionInfo, const Info& userInfo,
                                                const Info& storebag, std::uint16_t category,
                                                std::uint16_t type, const Info& payload,
-                                               const BackendFactory& newBackend) {
+                                               const BackendFactory& newBackend, SessionBook* book) {
   asl_log(platform.log, LogLevel::Debug, "TallydSession: Sending single message with sessionID {}",
           sessionInfo ? sessionInfo->integer(kTallySessionInfoSessionID).value_or(0) : 0);
   if (!storebag || !sessionInfo) {
@@ -129,8 +142,8 @@ void TallydSession::sendMessageWithSessionInfo(const platform::Platform& platfor
   }
   DeviceIDBuffer deviceID{};
   copyUniqueDeviceID(platform, deviceID);
-  const auto backends =
-      createBackendsFromStorebag(platform, storebag, sessionInfo, userInfo, deviceID.data(), newBackend);
+  const auto backends = createBackendsFromStorebag(platform, storebag, sessionInfo, userInfo, deviceID.data(),
+                                                   newBackend, book);
   if (!backends) {
     asl_log(platform.log, LogLevel::Critical, "TallydSession: No backends available to send single message");
     return;
@@ -139,6 +152,7 @@ void TallydSession::sendMessageWithSessionInfo(const platform::Platform& platfor
     asl_log(platform.log, LogLevel::Warning,
             "sendMessageWithSessionInfo: user info provided without requiring it.");
   }
+  if (book) bookOffer(book->messages(), &*backends, MessageNumbers{category});
   const timeval now = platform.clock.timeOfDay();
   for (const auto& [name, backend] : *backends) {
     backend->updateState();

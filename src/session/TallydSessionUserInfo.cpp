@@ -15,6 +15,7 @@ using platform::LogLevel;
 void TallydSession::receivedUserInfo(const Info& userInfo) {
   if (!userInfo) {
     asl_log(_platform.log, LogLevel::Debug, "Received nil user info for session {}", sessionID());
+    describeInBook();
     updateReportingStates();
     return;
   }
@@ -22,6 +23,7 @@ void TallydSession::receivedUserInfo(const Info& userInfo) {
     _userInfo = userInfo;
     _sessionDelegate.userInfoUpdatedForSession(*this);
   }
+  describeInBook();
   updateReportingStates();
   const auto parent = _sessionDelegate.parentSessionIDStringForSession(*this);
   const std::string own = combinedSessionIDString();

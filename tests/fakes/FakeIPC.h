@@ -60,6 +60,7 @@ class FakeServiceConnection : public platform::ServiceConnection {
       : _description(std::move(description)) {}
 
   [[nodiscard]] std::string description() const override { return _description; }
+  [[nodiscard]] std::optional<uid_t> peerUser() const override { return peer; }
   void setExportedInterface(const platform::Interface& exported) override { _interface = &exported; }
   void setExportedObject(std::shared_ptr<platform::ExportedObject> object) override {
     _object = std::move(object);
@@ -67,6 +68,8 @@ class FakeServiceConnection : public platform::ServiceConnection {
   void setInterruptionHandler(std::function<void()> handler) override { _interrupted = std::move(handler); }
   void setInvalidationHandler(std::function<void()> handler) override { _invalidated = std::move(handler); }
   void resume() override { _resumed = true; }
+
+  std::optional<uid_t> peer = 0;  ///< The user who connected.
 
   [[nodiscard]] const platform::Interface* exportedInterface() const { return _interface; }
   [[nodiscard]] bool resumed() const { return _resumed; }

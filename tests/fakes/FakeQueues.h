@@ -1,6 +1,8 @@
 // Serial queues that run when the test says so, on time that the test moves.
 #pragma once
 
+#include <poll.h>
+
 #include <algorithm>
 #include <deque>
 #include <map>
@@ -38,6 +40,11 @@ class FakeQueues : public platform::Queues {
     while (_state->fireNext(end)) run();
     _state->now = end;
   }
+  /// Calls the handlers of descriptors that have something to read, until none has, and runs all work.
+  void serveReadable() {
+    do run();
+    while (_state->giveReadable());
+  }
   [[nodiscard]] Milliseconds now() const { return _state->now; }
   [[nodiscard]] std::size_t armedTimers() const { return _state->timers.size(); }
 
@@ -48,6 +55,7 @@ class FakeQueues : public platform::Queues {
     std::mutex mutex;
     std::deque<Work> ready;
     std::multimap<Milliseconds, std::pair<int, Work>> timers;
+    std::map<int, std::pair<int, Work>> readers;  ///< By their IDs: descriptor and handler.
     Milliseconds now{0};
     int nextID = 1;
 
@@ -70,6 +78,26 @@ class FakeQueues : public platform::Queues {
     void disarm(int id) {
       const std::lock_guard lock(mutex);
       std::erase_if(timers, [id](const auto& timer) { return timer.second.first == id; });
+    }
+    int watch(int descriptor, Work handler) {
+      const std::lock_guard lock(mutex);
+      readers.emplace(nextID, std::pair(descriptor, std::move(handler)));
+      return nextID++;
+    }
+    void unwatch(int id) {
+      const std::lock_guard lock(mutex);
+      readers.erase(id);
+    }
+    bool giveReadable() {
+      const std::lock_guard lock(mutex);
+      bool any = false;
+      for (const auto& [id, reader] : readers) {
+        pollfd readable{.fd = reader.first, .events = POLLIN, .revents = 0};
+        if (::poll(&readable, 1, 0) != 1) continue;
+        ready.push_back(reader.second);
+        any = true;
+      }
+      return any;
     }
     bool fireNext(Milliseconds end) {
       const std::lock_guard lock(mutex);
@@ -115,7 +143,26 @@ class FakeQueues : public platform::Queues {
     Work _cancelHandler;
   };
 
-  /// A descriptor's source that never fires: what reads descriptors is tested on real queues.
+  /// Fires when the test serves what is readable.
+  class ReadSource : public platform::Source {
+   public:
+    ReadSource(std::shared_ptr<State> state, int descriptor, Work handler, Work cancelHandler)
+        : _state(std::move(state)),
+          _id(_state->watch(descriptor, std::move(handler))),
+          _cancelHandler(std::move(cancelHandler)) {}
+    ~ReadSource() override { cancel(); }
+    void cancel() override {
+      _state->unwatch(_id);
+      if (_cancelHandler) _state->give(std::exchange(_cancelHandler, {}));
+    }
+
+   private:
+    std::shared_ptr<State> _state;
+    const int _id;
+    Work _cancelHandler;
+  };
+
+  /// A source that never fires: what waits to write is tested on real queues.
   class IdleSource : public platform::Source {
    public:
     IdleSource(std::shared_ptr<State> state, Work cancelHandler)
@@ -141,8 +188,9 @@ class FakeQueues : public platform::Queues {
                                                 Work cancelHandler) override {
       return std::make_unique<Timer>(_state, first, period, std::move(handler), std::move(cancelHandler));
     }
-    std::unique_ptr<platform::Source> makeReadSource(int, Work, Work cancelHandler) override {
-      return std::make_unique<IdleSource>(_state, std::move(cancelHandler));
+    std::unique_ptr<platform::Source> makeReadSource(int descriptor, Work handler,
+                                                     Work cancelHandler) override {
+      return std::make_unique<ReadSource>(_state, descriptor, std::move(handler), std::move(cancelHandler));
     }
     std::unique_ptr<platform::Source> makeWriteSource(int, Work, Work cancelHandler) override {
       return std::make_unique<IdleSource>(_state, std::move(cancelHandler));

@@ -32,16 +32,18 @@ std::optional<std::string_view> bundlePathForClientType(std::int32_t clientType)
   }
 }
 
-/// Calls into the adaptor's code and stops what it throws.
+/// Calls into the adaptor's code and stops what it throws; false when it threw.
 template <class Call>
-void callAdaptor(platform::Log& log, std::string_view what, Call&& call) {
+bool callAdaptor(platform::Log& log, std::string_view what, Call&& call) {
   try {
     call();
+    return true;
   } catch (const std::exception& error) {
     asl_log(log, LogLevel::Error, "PithBackend: Pith adaptor threw in {}: {}", what, error.what());
   } catch (...) {
     asl_log(log, LogLevel::Error, "PithBackend: Pith adaptor threw in {}", what);
   }
+  return false;
 }
 
 }  // namespace
@@ -95,10 +97,11 @@ void PithBackend::makeAdaptor() {
 
 TallyBackend::Result PithBackend::sendMessage(const Payload& payload, const timeval& /*timestamp*/,
                                               std::uint16_t method, std::uint16_t respCode,
-                                              std::uint16_t /*eventID*/) {
+                                              std::uint16_t eventID) {
   if (_pithAdaptor && _pithAdaptorClass->sendMessageWithMethod_respCode_dict) {
-    forward(payload, method, respCode);
+    forward(payload, method, respCode, eventID);
   } else {
+    _account->dropNew(DropReason::AdaptorUnavailable, 1, {{method, eventID}});
     asl_log(_platform.log, LogLevel::Error,
             "PithBackend(sendMessage): Pith adaptor {} does not respond to forwarding selector {}",
             adaptorDescription(), kForwardingSelector);
@@ -106,13 +109,21 @@ TallyBackend::Result PithBackend::sendMessage(const Payload& payload, const time
   return std::nullopt;
 }
 
-void PithBackend::forward(const Payload& payload, std::uint16_t method, std::uint16_t respCode) const {
+void PithBackend::forward(const Payload& payload, std::uint16_t method, std::uint16_t respCode,
+                          std::uint16_t eventID) const {
   const auto list = payload ? adaptorPayload(*payload, _platform.log) : std::nullopt;
-  if (payload && !list) return;
+  if (payload && !list) return _account->dropNew(DropReason::NotPostable, 1, {{method, eventID}});
+  _account->start();
   const void* bytes = list ? list->data() : nullptr;
   const std::size_t length = list ? list->size() : 0;
-  callAdaptor(_platform.log, kForwardingSelector, [&] {
+  const bool returned = callAdaptor(_platform.log, kForwardingSelector, [&] {
     _pithAdaptorClass->sendMessageWithMethod_respCode_dict(_pithAdaptor, method, respCode, bytes, length);
+  });
+  if (!returned) return _account->drop(DropReason::AdaptorThrew, 1, {{method, eventID}});
+  _account->finish();
+  _account->show("adaptor", [&](TapLine& line) {
+    line.add("method", unsigned{method}).add("respCode", unsigned{respCode}).add("event", unsigned{eventID});
+    if (payload) line.add("payload", *payload);
   });
 }
 

@@ -21,6 +21,8 @@ namespace tallyd {
 /// (framework/PithAdaptor.h) and calls it with every message. A bundle that can't be loaded and a class that
 /// lacks something are no reason not to exist: each message then costs one error line.
 ///
+/// Books: messages; one is sent when the adaptor has returned.
+///
 /// What the adaptor throws is caught and logged. Threading: the session's queue, which waits for the adaptor.
 class PithBackend final : public TallyBackend {
  public:
@@ -34,6 +36,7 @@ class PithBackend final : public TallyBackend {
       const std::optional<std::string>& productFamily);
   ~PithBackend() override;
 
+  [[nodiscard]] std::string_view kind() const override { return "adaptor"; }
   using TallyBackend::sendMessage;
   /// Always nothing. Neither the timestamp nor the event ID is passed on.
   Result sendMessage(const Payload& payload, const timeval& timestamp, std::uint16_t method,
@@ -44,7 +47,8 @@ class PithBackend final : public TallyBackend {
 
   [[nodiscard]] bool loadAdaptor(std::int32_t clientType);
   void makeAdaptor();
-  void forward(const Payload& payload, std::uint16_t method, std::uint16_t respCode) const;
+  void forward(const Payload& payload, std::uint16_t method, std::uint16_t respCode,
+               std::uint16_t eventID) const;
   /// "<PithAdaptor: ADDRESS>", or "(null)" without one.
   [[nodiscard]] std::string adaptorDescription() const;
 

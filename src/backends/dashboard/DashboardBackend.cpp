@@ -8,6 +8,7 @@
 #include <chrono>
 #include <new>
 
+#include "backends/RequestBooking.h"
 #include "backends/dashboard/DatagramSender.h"
 #include "backends/dashboard/LocalLog.h"
 #include "platform/Clock.h"
@@ -94,7 +95,7 @@ DashboardBackend::DashboardBackend(const platform::Platform& platform, std::stri
                                    const Payload& profile, const std::optional<std::string>& productFamily,
                                    platform::FileDescriptor socket)
     : TallyBackend(platform, name, profile, productFamily),
-      _sender(std::make_shared<DatagramSender>(platform.log, platform.queues, std::move(socket))) {}
+      _sender(std::make_shared<DatagramSender>(platform.log, platform.queues, std::move(socket), _account)) {}
 
 bool DashboardBackend::startWithProfile() {
   _usingProfile = true;
@@ -121,6 +122,11 @@ bool DashboardBackend::startWithServer(const std::optional<std::string>& serverI
 
 DashboardBackend::~DashboardBackend() { _sender->drop(); }
 
+void DashboardBackend::setAccount(std::shared_ptr<Account> account) {
+  _sender->setAccount(account);
+  TallyBackend::setAccount(std::move(account));
+}
+
 void DashboardBackend::cleanup() { _sender->cleanup(); }
 
 TallyBackend::Result DashboardBackend::sendMessage(const Payload& payload, const timeval& timestamp,
@@ -142,36 +148,53 @@ TallyBackend::Result DashboardBackend::sendMessage(const Payload& payload, const
     datagram = std::make_shared<const Datagram>(facts, payload);
   } catch (const std::bad_alloc&) {
     asl_log(_platform.log, LogLevel::Error, "Tally (DashboardBackend): can't malloc.");
+    _account->dropNew(DropReason::OutOfMemory, 1, {{method, eventID}});
     return std::nullopt;
   }
   Result line = writeLocalLog(datagram->bytes());
+  _account->start();
   _sender->send(std::move(datagram));
   return line;
 }
 
 bool DashboardBackend::uploadLogData(const platform::Array& logData) {
+  _account->start();
   if (!_postURL) {
     asl_log(_platform.log, LogLevel::Error, "Tally (DashboardBackend): Post URL for log data array is nil");
+    _account->drop(DropReason::NotUploadable);
     return false;
   }
   auto archive = platform::archivedDataWithRootObject(logData);
   if (!archive) {
     asl_log(_platform.log, LogLevel::Error,
             "Tally (DashboardBackend): Failed to serialize log data array for upload");
+    _account->drop(DropReason::NotUploadable);
     return false;
   }
-  const platform::HTTPResult result =
-      _platform.http.sendSynchronousRequest({.url = *_postURL,
-                                             .method = "POST",
-                                             .headers = {{"Content-Type", "application/octet-stream"}},
-                                             .body = platform::Data(std::move(*archive))});
+  const platform::HTTPResult result = postLogData(platform::Data(std::move(*archive)));
   if (result.error || !result.response) {
     asl_log(_platform.log, LogLevel::Error, "Tally (DashboardBackend): Error uploading log data array ({})",
             result.error.value_or("(null)"));
+    _account->drop(DropReason::UploadFailed);
     return false;
   }
+  _account->finish(1, answerOf(result));
   reportUpload(platform::withBrokenUTF8Replaced(result.data.bytes()));
   return true;
+}
+
+platform::HTTPResult DashboardBackend::postLogData(platform::Data archive) const {
+  const std::uint64_t bytes = archive.size();
+  platform::HTTPResult result =
+      _platform.http.sendSynchronousRequest({.url = *_postURL,
+                                             .method = "POST",
+                                             .headers = {{"Content-Type", "application/octet-stream"}},
+                                             .body = std::move(archive)});
+  _account->show("log-data", [&](TapLine& line) {
+    line.add("url", *_postURL).add("bytes", bytes);
+    addResult(line, result);
+  });
+  return result;
 }
 
 void DashboardBackend::reportUpload(std::string_view location) {

@@ -11,7 +11,8 @@
 
 namespace tallyd::platform {
 class FileDescriptor;
-}
+struct HTTPResult;
+}  // namespace tallyd::platform
 
 namespace tallyd {
 
@@ -22,6 +23,9 @@ class DatagramSender;
 /// Sending is fire-and-forget unless the profile asks for reliable delivery. At most 50 datagrams wait. The
 /// socket, the timer and the queue outlive this object by what its datagrams still need: after cleanup() a
 /// tick and 9.5 s, without it 21 ticks.
+///
+/// Books: datagrams, and log data that is uploaded. A datagram is sent when the network took it, with
+/// reliable delivery when it was acknowledged; log data when the server has answered, with whatever status.
 ///
 /// Threading: the session's queue; no message touches the network there. Uploads block it.
 class DashboardBackend final : public TallyBackend {
@@ -43,6 +47,8 @@ class DashboardBackend final : public TallyBackend {
   /// Lets the datagrams that wait run out.
   ~DashboardBackend() override;
 
+  [[nodiscard]] std::string_view kind() const override { return "dashboard"; }
+  void setAccount(std::shared_ptr<Account> account) override;
   void cleanup() override;
   using TallyBackend::sendMessage;
   /// The line for the message log.
@@ -57,6 +63,7 @@ class DashboardBackend final : public TallyBackend {
 
   [[nodiscard]] bool startWithProfile();
   [[nodiscard]] bool startWithServer(const std::optional<std::string>& serverIP, std::uint16_t serverPort);
+  [[nodiscard]] platform::HTTPResult postLogData(platform::Data archive) const;
   void reportUpload(std::string_view location);
 
   const std::shared_ptr<DatagramSender> _sender;

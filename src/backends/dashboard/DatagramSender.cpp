@@ -1,5 +1,6 @@
 #include "backends/dashboard/DatagramSender.h"
 
+#include <arpa/inet.h>
 #include <sys/socket.h>
 
 #include <array>
@@ -28,12 +29,32 @@ std::unique_ptr<Source> sourceOrNothing(Make&& make) {
 
 const sockaddr* generic(const sockaddr_in& address) { return reinterpret_cast<const sockaddr*>(&address); }
 
+std::string addressText(const sockaddr_in& address) {
+  std::array<char, INET_ADDRSTRLEN> text{};
+  ::inet_ntop(AF_INET, &address.sin_addr, text.data(), text.size());
+  return fmt::format("{}:{}", text.data(), ntohs(address.sin_port));
+}
+
+std::string hexadecimal(std::string_view bytes) {
+  std::string text;
+  text.reserve(2 * bytes.size());
+  for (const char byte : bytes) {
+    fmt::format_to(std::back_inserter(text), "{:02x}", static_cast<unsigned char>(byte));
+  }
+  return text;
+}
+
 }  // namespace
 
-DatagramSender::DatagramSender(platform::Log& log, platform::Queues& queues, platform::FileDescriptor socket)
+DatagramSender::DatagramSender(platform::Log& log, platform::Queues& queues, platform::FileDescriptor socket,
+                               std::shared_ptr<Account> account)
     : _log(log),
       _networkProcQueue(queues.makeSerialQueue("com.quillon.Tally.networkProc")),
-      _socket(std::move(socket)) {}
+      _socket(std::move(socket)),
+      _account(std::move(account)),
+      _messageQueue(_account) {}
+
+DatagramSender::~DatagramSender() { _messageQueue.drop(DropReason::CleanUp); }
 
 void DatagramSender::useReliableUDP() {
   sockaddr_in anyPort{};
@@ -52,6 +73,7 @@ void DatagramSender::useReliableUDP() {
 }
 
 bool DatagramSender::start(const sockaddr_in& server, Milliseconds period) {
+  _server = server;
   if (::connect(_socket.get(), generic(server), sizeof server) != 0) {
     asl_log(_log, LogLevel::Error, "Tally (DashboardBackend): initWitName socket connect failed.");
     _readSource.reset();
@@ -73,6 +95,13 @@ bool DatagramSender::start(const sockaddr_in& server, Milliseconds period) {
   }
   _isStarted = true;
   return true;
+}
+
+void DatagramSender::setAccount(std::shared_ptr<Account> account) {
+  _networkProcQueue->async([self = shared_from_this(), account = std::move(account)] {
+    self->_messageQueue.setAccount(account);
+    self->_account = account;
+  });
 }
 
 void DatagramSender::send(std::shared_ptr<const Datagram> datagram) {
@@ -103,15 +132,26 @@ void DatagramSender::drop() {
 
 void DatagramSender::tryToSendMsg(const Datagram& datagram) {
   const bool isSent = sendAllBytes(datagram.bytes());
-  if (isSent && _delivery == Delivery::FireAndForget) return;
+  if (isSent && _delivery == Delivery::FireAndForget) return _account->finish();
   UDPPacketToSend packet(datagram.bytes(), datagram.eventID());
   if (isSent) packet.setState(PacketStateWaiting);
   _messageQueue.append(std::move(packet));
+  if (!_timer) _messageQueue.drop(DropReason::CleanUp);  // Nothing looks after it any more.
 }
 
 bool DatagramSender::sendAllBytes(std::string_view bytes) const {
   const ssize_t sent = ::send(_socket.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
-  return sent == static_cast<ssize_t>(bytes.size());
+  if (sent != static_cast<ssize_t>(bytes.size())) return false;
+  showOnTap(bytes);
+  return true;
+}
+
+void DatagramSender::showOnTap(std::string_view bytes) const {
+  _account->show("datagram", [&](TapLine& line) {
+    line.add("server", addressText(_server)).add("method", datagramNumber16(bytes, DatagramMethod));
+    line.add("event", datagramNumber16(bytes, DatagramEventID)).add("bytes", hexadecimal(bytes));
+    line.add("text", bytes.substr(DatagramText));
+  });
 }
 
 void DatagramSender::myPeriodicTask() {
@@ -150,6 +190,7 @@ void DatagramSender::processSocketRead() {
 void DatagramSender::cleanupSources() {
   _timer.reset();
   _readSource.reset();
+  _messageQueue.drop(DropReason::CleanUp);
 }
 
 }  // namespace tallyd

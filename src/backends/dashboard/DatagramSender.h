@@ -43,7 +43,10 @@ class DatagramSender : public std::enable_shared_from_this<DatagramSender> {
   static constexpr int kTicksAfterDrop = 21;
 
   /// Borrows the log, which must outlive the queue's work. The socket must not block.
-  DatagramSender(platform::Log& log, platform::Queues& queues, platform::FileDescriptor socket);
+  DatagramSender(platform::Log& log, platform::Queues& queues, platform::FileDescriptor socket,
+                 std::shared_ptr<Account> account = std::make_shared<Account>());
+  /// Books what still waits as dropped.
+  ~DatagramSender();
 
   /// Binds the socket and asks for acknowledgements. Each failure is logged: one to bind leaves the delivery
   /// as it was, one to listen leaves it reliable without acknowledgements.
@@ -53,6 +56,9 @@ class DatagramSender : public std::enable_shared_from_this<DatagramSender> {
   /// Never changes after the set-up.
   [[nodiscard]] bool reliableUDP() const { return _delivery == Delivery::Reliable; }
 
+  /// Before the first datagram.
+  void setAccount(std::shared_ptr<Account> account);
+  /// Takes a datagram that is booked as being in flight.
   void send(std::shared_ptr<const Datagram> datagram);
   /// Ends at once when nothing waits, else when nothing waits any more, or after a tick and 9.5 s.
   void cleanup();
@@ -64,6 +70,7 @@ class DatagramSender : public std::enable_shared_from_this<DatagramSender> {
 
   void tryToSendMsg(const Datagram& datagram);
   [[nodiscard]] bool sendAllBytes(std::string_view bytes) const;
+  void showOnTap(std::string_view bytes) const;
   void myPeriodicTask();
   void advanceCleanup();
   void advanceDrop();
@@ -75,6 +82,8 @@ class DatagramSender : public std::enable_shared_from_this<DatagramSender> {
   platform::FileDescriptor _socket;
   Delivery _delivery = Delivery::FireAndForget;
   bool _isStarted = false;
+  sockaddr_in _server{};
+  std::shared_ptr<Account> _account;
   MessageQueue _messageQueue;
   std::unique_ptr<platform::Source> _readSource;
   std::unique_ptr<platform::Source> _timer;

@@ -1,5 +1,6 @@
 #include "backends/https-post/HTTPSPostBackend.h"
 
+#include "backends/RequestBooking.h"
 #include "backends/https-post/EventRecord.h"
 #include "backends/https-post/PostBody.h"
 #include "framework/Tally.h"
@@ -31,9 +32,15 @@ bool isTimeSetAutomatically(const platform::Platform& platform) {
   return !automatic || automatic->booleanValue();
 }
 
-/// On the completion queue, after the backend may have gone: knows the log only.
+/// On the completion queue, after the backend may have gone: knows log and books only.
 void logPostError(platform::Log& log, const platform::HTTPResult& result) {
   if (result.error) asl_log(log, LogLevel::Error, "Tally(sendMessage) post error: {}", *result.error);
+}
+
+void bookPost(Account& account, std::size_t events, const platform::HTTPResult& result) {
+  if (!result.error) return account.finish(events, answerOf(result));
+  const bool outOfMemory = result.failure == platform::HTTPFailure::TooMuchWaits;
+  account.drop(outOfMemory ? DropReason::MemoryBound : DropReason::PostFailed, events);
 }
 
 }  // namespace
@@ -60,37 +67,45 @@ HTTPSPostBackend::HTTPSPostBackend(const platform::Platform& platform, std::stri
 }
 
 HTTPSPostBackend::~HTTPSPostBackend() {
-  if (!_batchEvents || !_batchedEvents || _state != ReportingStateOn) return;
-  const auto json = takeBatchForPost();
-  const Result posted = json ? postJsonMessage(*json) : std::nullopt;
+  if (!_batchEvents || !_batchedEvents || _state != ReportingStateOn) {
+    if (_batchedEvents) _account->dropHeld(DropReason::CleanUp, _batchedEvents->size());
+    return;
+  }
+  const auto document = takeBatchForPost();
+  const Result posted = document ? postJsonMessage(*document) : std::nullopt;
   asl_log(_platform.log, LogLevel::Debug, "dealloc: flush batched events, {}", posted.value_or("(null)"));
 }
 
 TallyBackend::Result HTTPSPostBackend::sendMessage(const Payload& payload, const timeval& timestamp,
                                                    std::uint16_t method, std::uint16_t respCode,
                                                    std::uint16_t eventID) {
-  if (_state == ReportingStateOff) return std::nullopt;
+  const MessageNumbers numbers{method, eventID};
+  if (_state == ReportingStateOff) {
+    _account->dropNew(DropReason::StateOff, 1, numbers);
+    return std::nullopt;
+  }
   Dictionary event =
       createEventDictfromPayload(respCode == kSessionStopRespCode ? stopMessagePayload(payload) : payload,
                                  timestamp, method, respCode, eventID);
   asl_log(_platform.log, LogLevel::Debug, "Tally (sendMessage): {:d}, {:d}, {:d}", _state, _batchEvents,
           _requireUserInfo);
   if (_state == ReportingStatePending || _batchEvents || !hasRequiredUserInfo()) {
-    batchEvent(std::move(event));
+    batchEvent(std::move(event), numbers);
     return std::nullopt;
   }
   Events events{std::move(event)};
+  _account->start();
   prepareEventArrayForMessage(events);
-  const auto json = createMessageForPost(std::move(events));
-  return json ? postJsonMessage(*json) : std::nullopt;
+  const auto document = createMessageForPost(std::move(events));
+  return document ? postJsonMessage(*document) : std::nullopt;
 }
 
 TallyBackend::Result HTTPSPostBackend::flushMessages() {
   if (!_batchEvents || !_batchedEvents || _state != ReportingStateOn || !hasRequiredUserInfo())
     return std::nullopt;
-  const auto json = takeBatchForPost();
+  const auto document = takeBatchForPost();
   _eventMethodCounts.clear();
-  return json ? postJsonMessage(*json) : std::nullopt;
+  return document ? postJsonMessage(*document) : std::nullopt;
 }
 
 void HTTPSPostBackend::setCorrelatedSessionID(const std::string& correlatedSessionID) {
@@ -104,7 +119,7 @@ void HTTPSPostBackend::updateState() {
   _state = updateBackendState();
   if (_batchEvents || !_batchedEvents || _state != ReportingStateOn) return;
   // Unlike flushMessages, this way out leaves the counts by method as they are.
-  if (const auto json = takeBatchForPost()) postJsonMessage(*json);
+  if (const auto document = takeBatchForPost()) postJsonMessage(*document);
 }
 
 std::int32_t HTTPSPostBackend::updateBackendState() {
@@ -220,21 +235,24 @@ platform::Dictionary HTTPSPostBackend::createEventDictfromPayload(const Payload&
                                .timezoneOffset = _platform.locale.offsetFromGMT(_platform.clock.now())});
 }
 
-void HTTPSPostBackend::batchEvent(Dictionary event) {
+void HTTPSPostBackend::batchEvent(Dictionary event, const MessageNumbers& numbers) {
   if (!_batchedEvents) _batchedEvents.emplace();
   const std::string method(event.string("_method").value_or(""));
   std::int32_t& count = _eventMethodCounts[method];
   if (count > _eventThreshold) {
     asl_log(_platform.log, LogLevel::Debug, "HTTPSPostBackend: Dropping batched event ({})", method);
+    _account->dropNew(DropReason::MethodLimit, 1, numbers);
     return;
   }
   _batchedEvents->push_back(std::move(event));
+  _account->hold();
   ++count;
 }
 
-std::optional<std::string> HTTPSPostBackend::takeBatchForPost() {
+std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::takeBatchForPost() {
   Events events = std::move(*_batchedEvents);
   _batchedEvents.reset();
+  _account->startHeld(events.size());
   prepareEventArrayForMessage(events);
   return createMessageForPost(std::move(events));
 }
@@ -246,15 +264,22 @@ void HTTPSPostBackend::prepareEventArrayForMessage(Events& events) const {
   }
 }
 
-std::optional<std::string> HTTPSPostBackend::createMessageForPost(Events events) const {
+std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::createMessageForPost(Events events) const {
   const timeval now = _platform.clock.timeOfDay();
   for (Dictionary& event : events) sanitizeEventForJSON(event, _platform.log);
   auto clientIdentifier = Tally(_platform).getPersistentIdentifierForDNU(_dnuType == DNUTypeConsent);
   if (_extrasOnInternal != 0 && _isInternal) clientIdentifier = _udid;
-  return postBody(now, clientIdentifier, std::move(events));
+  const std::size_t count = events.size();
+  auto json = postBody(now, clientIdentifier, std::move(events));
+  if (!json || !clientIdentifier) {
+    _account->drop(json ? DropReason::NoClientIdentifier : DropReason::NotPostable, count);
+  }
+  if (!json) return std::nullopt;
+  return Document{std::move(*json), clientIdentifier ? count : 0};
 }
 
-TallyBackend::Result HTTPSPostBackend::postJsonMessage(const std::string& json) const {
+TallyBackend::Result HTTPSPostBackend::postJsonMessage(const Document& document) const {
+  const std::string& json = document.json;
   auto compressed = gzipDeflate(json, _platform.log);
   platform::HTTPRequest request;
   request.url = _postURL.value_or("");
@@ -272,10 +297,31 @@ TallyBackend::Result HTTPSPostBackend::postJsonMessage(const std::string& json) 
   request.body = platform::Data(plain ? json : std::move(*compressed));
   request.headers.emplace_back("Content-Length", std::to_string(request.body.size()));
   if (!plain) request.headers.emplace_back("Content-Encoding", "gzip");
-  platform::Log& log = _platform.log;
-  _platform.http.sendAsynchronousRequest(
-      std::move(request), _queue, [&log](const platform::HTTPResult& result) { logPostError(log, result); });
+  auto completion = completionFor(document, request);
+  _platform.http.sendAsynchronousRequest(std::move(request), _queue, std::move(completion));
   return _dnuType == DNUTypeConsent && _dnuEnabled ? Result(json) : std::nullopt;
+}
+
+platform::HTTPClient::Completion HTTPSPostBackend::completionFor(const Document& document,
+                                                                 const platform::HTTPRequest& request) const {
+  Tap* const tap = _account->listeningTap();
+  const std::uint64_t post = tap ? tap->nextNumber() : 0;
+  _account->show("post", [&](TapLine& line) {
+    const bool gzipped = request.headers.back().first == "Content-Encoding";
+    line.add("post", post).add("url", request.url).add("encoding", gzipped ? "gzip" : "identity");
+    line.add("bytes", std::uint64_t{request.body.size()}).add("events", std::uint64_t{document.events});
+    line.addJSON("document", document.json);
+  });
+  return [&log = _platform.log, account = _account, events = document.events,
+          post](const platform::HTTPResult& result) {
+    logPostError(log, result);
+    bookPost(*account, events, result);
+    if (post == 0) return;
+    account->show("post", [&](TapLine& line) {
+      line.add("post", post);
+      addResult(line, result);
+    });
+  };
 }
 
 }  // namespace tallyd

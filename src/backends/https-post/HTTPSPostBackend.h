@@ -10,6 +10,7 @@
 #include "backends/TallyBackend.h"
 #include "backends/https-post/EventFilters.h"
 #include "backends/https-post/ReportingRules.h"
+#include "platform/HTTPClient.h"
 
 namespace tallyd::platform {
 class SerialQueue;
@@ -21,7 +22,10 @@ namespace tallyd {
 /// in a batch while it may not be posted yet or batching is asked for.
 ///
 /// A batch holds at most threshold + 1 events of one method. Posts go to the shared transfer engine and are
-/// not retried; what becomes of them is only logged. Threading: the session's queue; the posts' completions
+/// not retried; what becomes of them is only logged.
+///
+/// Books: events. Those of a batch are held; those of a post are in flight until it is done, and then sent
+/// when there was a response, with whatever status. Threading: the session's queue; the posts' completions
 /// run on a queue of the backend's own and touch no backend.
 class HTTPSPostBackend final : public TallyBackend {
  public:
@@ -34,6 +38,7 @@ class HTTPSPostBackend final : public TallyBackend {
   /// Posts a batch that may be posted.
   ~HTTPSPostBackend() override;
 
+  [[nodiscard]] std::string_view kind() const override { return "https-post"; }
   using TallyBackend::sendMessage;
   /// The posted document when the user consents to see it; nothing when nothing was posted.
   Result sendMessage(const Payload& payload, const timeval& timestamp, std::uint16_t method,
@@ -53,6 +58,12 @@ class HTTPSPostBackend final : public TallyBackend {
  private:
   using Events = std::vector<Dictionary>;
 
+  /// A document that is ready to go.
+  struct Document {
+    std::string json;
+    std::size_t events = 0;  ///< In flight with it.
+  };
+
   HTTPSPostBackend(const platform::Platform& platform, std::string_view name, const Payload& profile,
                    const std::optional<std::string>& productFamily);
 
@@ -65,13 +76,17 @@ class HTTPSPostBackend final : public TallyBackend {
   Dictionary createEventDictfromPayload(const Payload& payload, const timeval& timestamp,
                                         std::uint16_t method, std::uint16_t respCode,
                                         std::uint16_t eventID) const;
-  void batchEvent(Dictionary event);
+  void batchEvent(Dictionary event, const MessageNumbers& numbers);
   [[nodiscard]] bool hasRequiredUserInfo() const { return !_requireUserInfo || _userInfoDict; }
   /// Prepares and takes the batch away; what is left is no batch.
-  std::optional<std::string> takeBatchForPost();
+  std::optional<Document> takeBatchForPost();
   void prepareEventArrayForMessage(Events& events) const;
-  std::optional<std::string> createMessageForPost(Events events) const;
-  Result postJsonMessage(const std::string& json) const;
+  /// Takes events that are booked as being in flight.
+  std::optional<Document> createMessageForPost(Events events) const;
+  Result postJsonMessage(const Document& document) const;
+  /// What is to happen once the post is done; shows the post on the tap.
+  platform::HTTPClient::Completion completionFor(const Document& document,
+                                                 const platform::HTTPRequest& request) const;
 
   const std::shared_ptr<platform::SerialQueue> _queue;
   std::optional<std::string> _postURL;

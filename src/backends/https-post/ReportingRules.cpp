@@ -50,15 +50,33 @@ std::optional<std::int32_t> integer32(const Dictionary& entry, std::string_view 
   return number ? std::optional(static_cast<std::int32_t>(*number)) : std::nullopt;
 }
 
-const Dictionary* chooseClientEntry(const Array& clients, const Dictionary& userInfo) {
+/// Writes down the steps for whoever asked for them.
+class Steps {
+ public:
+  explicit Steps(ReportingTrace* trace) : _trace(trace) {}
+
+  void atEntry(std::size_t index) { _entryIndex = index; }
+  /// Gives `passed` back.
+  bool take(ReportingRule rule, bool passed) {
+    if (_trace) _trace->push_back({rule, passed, _entryIndex});
+    return passed;
+  }
+
+ private:
+  ReportingTrace* _trace;
+  std::optional<std::size_t> _entryIndex;
+};
+
+const Dictionary* chooseClientEntry(const Array& clients, const Dictionary& userInfo, Steps& steps) {
   const auto clientName = userInfo.string(kTallyUserInfoClientName);
   const auto serviceName = userInfo.string(kTallyUserInfoServiceName);
-  for (const Value& element : clients) {
-    const Dictionary* entry = element.dictionary();
-    if (entry && matchExactStringWithList(splitAtCommas(entry->string("client")), clientName, true) &&
-        matchStringWithList(splitAtCommas(entry->string("service")), serviceName, true)) {
-      return entry;
-    }
+  for (std::size_t i = 0; i < clients.size(); ++i) {
+    const Dictionary* entry = clients[i].dictionary();
+    steps.atEntry(i);
+    const bool matches = entry &&
+                         matchExactStringWithList(splitAtCommas(entry->string("client")), clientName, true) &&
+                         matchStringWithList(splitAtCommas(entry->string("service")), serviceName, true);
+    if (steps.take(ReportingRule::ClientEntry, matches)) return entry;
   }
   return nullptr;
 }
@@ -83,30 +101,33 @@ DNUType dnuTypeFor(std::int32_t override_dnu, bool consented) {
 }
 
 /// The rules of the chosen entry, in their order; each refusal leaves the later ones unread.
-ReportingDecision decideByEntry(const ReportingCircumstances& circumstances, const Dictionary& entry) {
+ReportingDecision decideByEntry(const ReportingCircumstances& circumstances, const Dictionary& entry,
+                                Steps& steps) {
   ReportingDecision decision;
   decision.entry = entry;
   decision.hierarchy = integer32(entry, "hierarchy").value_or(0);
   decision.override_dnu = integer32(entry, "override_dnu").value_or(0);
   decision.dnuType = dnuTypeFor(decision.override_dnu, circumstances.consented);
-  if (decision.dnuType == DNUTypeConsent && !circumstances.consented)
-    return off(decision, ReportingReason::NoConsent);
+  const bool mayReport = decision.dnuType != DNUTypeConsent || circumstances.consented;
+  if (!steps.take(ReportingRule::Consent, mayReport)) return off(decision, ReportingReason::NoConsent);
 
   // The flag is false: without a locale list nobody reports, and a device without a country passes any list.
-  if (!matchStringWithList(stringsOf(entry.array("locale_whitelist")), circumstances.countryCode, false)) {
-    return off(decision, ReportingReason::LocaleNotListed);
-  }
-  if (!matchStringWithList(stringsOf(entry.array("device_whitelist")), circumstances.productFamily, true)) {
-    return off(decision, ReportingReason::DeviceNotListed);
-  }
+  const bool inLocale =
+      matchStringWithList(stringsOf(entry.array("locale_whitelist")), circumstances.countryCode, false);
+  if (!steps.take(ReportingRule::Locale, inLocale)) return off(decision, ReportingReason::LocaleNotListed);
+  const bool onDevice =
+      matchStringWithList(stringsOf(entry.array("device_whitelist")), circumstances.productFamily, true);
+  if (!steps.take(ReportingRule::Device, onDevice)) return off(decision, ReportingReason::DeviceNotListed);
   const Array* filters = entry.array("filters");
-  if (!filters) return off(decision, ReportingReason::NoFilters);
+  if (!steps.take(ReportingRule::Filters, filters != nullptr))
+    return off(decision, ReportingReason::NoFilters);
   decision.filters = *filters;
 
   decision.reachedSampling = true;
   const auto threshold = entry.real("sampling_threshold");
   if (threshold) decision.samplingThreshold = *entry.find("sampling_threshold");
-  const bool sampled = threshold && circumstances.samplingFactor <= *threshold;
+  const bool sampled =
+      steps.take(ReportingRule::Sampling, threshold && circumstances.samplingFactor <= *threshold);
   decision.state = sampled ? ReportingStateOn : ReportingStateOff;
   decision.reason = sampled ? ReportingReason::Sampled : ReportingReason::NotSampled;
 
@@ -127,14 +148,18 @@ bool matchStringWithList(const MatchList& list, std::optional<std::string_view> 
   return matchList(list, wholeString, whitelist, platform::containsIgnoringCase);
 }
 
-ReportingDecision decideReporting(const ReportingCircumstances& circumstances) {
-  if (!circumstances.requireUserInfo) return early(ReportingStateOn, ReportingReason::UserInfoNotRequired);
-  if (!circumstances.userInfo) return early(ReportingStatePending, ReportingReason::NoUserInfo);
+ReportingDecision decideReporting(const ReportingCircumstances& circumstances, ReportingTrace* trace) {
+  Steps steps(trace);
+  if (steps.take(ReportingRule::UserInfoNotRequired, !circumstances.requireUserInfo))
+    return early(ReportingStateOn, ReportingReason::UserInfoNotRequired);
+  if (!steps.take(ReportingRule::UserInfo, circumstances.userInfo.has_value()))
+    return early(ReportingStatePending, ReportingReason::NoUserInfo);
   const Array* clients = circumstances.profile.array("clients");
-  if (!clients) return early(ReportingStateOff, ReportingReason::NoClientList);
-  const Dictionary* entry = chooseClientEntry(*clients, *circumstances.userInfo);
+  if (!steps.take(ReportingRule::ClientList, clients != nullptr))
+    return early(ReportingStateOff, ReportingReason::NoClientList);
+  const Dictionary* entry = chooseClientEntry(*clients, *circumstances.userInfo, steps);
   if (!entry) return early(ReportingStatePending, ReportingReason::NoMatchingClient);
-  return decideByEntry(circumstances, *entry);
+  return decideByEntry(circumstances, *entry, steps);
 }
 
 }  // namespace tallyd

@@ -60,8 +60,33 @@ struct ReportingDecision {
   std::optional<std::string> postURL;
 };
 
+/// The rules in the order in which they are asked.
+enum class ReportingRule {
+  UserInfoNotRequired,  ///< Passed by a session that requires none; that ends the rules.
+  UserInfo,
+  ClientList,
+  ClientEntry,  ///< Once for each entry, up to the one that is chosen.
+  Consent,
+  Locale,
+  Device,
+  Filters,
+  Sampling,
+};
+
+/// One answer of the rules on their way to a decision.
+struct ReportingStep {
+  ReportingRule rule = ReportingRule::UserInfo;
+  bool passed = false;
+  std::optional<std::size_t> entryIndex{};  ///< Of the client entry, from that rule on.
+  bool operator==(const ReportingStep&) const = default;
+};
+using ReportingTrace = std::vector<ReportingStep>;
+
 /// Evaluates the rules from the beginning. Pure; any thread.
-[[nodiscard]] ReportingDecision decideReporting(const ReportingCircumstances& circumstances);
+///
+/// @param trace  Takes the steps, behind what it holds; null when nobody asks.
+[[nodiscard]] ReportingDecision decideReporting(const ReportingCircumstances& circumstances,
+                                                ReportingTrace* trace = nullptr);
 
 /// Strings to match against; nothing where the storebag gives no list.
 using MatchList = std::optional<std::vector<std::string_view>>;

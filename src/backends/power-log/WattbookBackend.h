@@ -14,6 +14,7 @@ namespace tallyd {
 /// Hands each message that has a method and a payload to the power log: the payload with the method, the
 /// response code and the event ID on top. Needs no profile and keeps nothing.
 ///
+/// Books: records; one is sent when the power log has it, which says itself what it could not write.
 /// Threading: the session's queue, which waits for the power log's disk.
 class WattbookBackend final : public TallyBackend {
  public:
@@ -24,6 +25,7 @@ class WattbookBackend final : public TallyBackend {
       const platform::Platform& platform, std::string_view name, const Payload& profile,
       const std::optional<std::string>& productFamily);
 
+  [[nodiscard]] std::string_view kind() const override { return "power-log"; }
   using TallyBackend::sendMessage;
   /// Always nothing.
   Result sendMessage(const Payload& payload, const timeval& timestamp, std::uint16_t method,

@@ -4,6 +4,7 @@
 
 #include <new>
 
+#include "backends/RequestBooking.h"
 #include "backends/upload/UploadFile.h"
 #include "backends/upload/UploadURL.h"
 #include "platform/HTTPClient.h"
@@ -69,15 +70,20 @@ UploadBackend::UploadBackend(const platform::Platform& platform, std::string_vie
 
 bool UploadBackend::uploadFileAtPath(std::string_view path, std::string_view extensionToken) {
   asl_log(_platform.log, LogLevel::Debug, "Tally(uploadFileAtPath): Uploading file {}", path);
-  if (!_uploadURL) return false;
+  const auto notUploadable = [this] {
+    _account->drop(DropReason::NotUploadable);
+    return false;
+  };
+  _account->start();
+  if (!_uploadURL) return notUploadable();
   const std::string filePath(path);
   const SandboxExtension extension(_platform.sandbox, extensionToken);
   auto body = compressedFile(filePath);
-  if (!body) return false;
+  if (!body) return notUploadable();
   const std::string url = uploadURLForFile(*_uploadURL, _udid ? _udid : "(null)", _sessionID, path);
   if (!hasURLCharactersOnly(url)) {
     asl_log(_platform.log, LogLevel::Error, "Tally(uploadFileAtPath): Unable to create URL request");
-    return false;
+    return notUploadable();
   }
   post(filePath, url, std::move(*body));
   return true;
@@ -121,7 +127,15 @@ void UploadBackend::post(const std::string& path, const std::string& url, std::s
   request.headers = {{"Content-Type", "application/octet-stream"}, {"Content-Encoding", "gzip"}};
   request.body = platform::Data(std::move(body));
   const platform::HTTPResult result = _platform.http.sendSynchronousRequest(request);
-  if (result.response) return takeAnswer(path, result.data.bytes());
+  _account->show("upload", [&](TapLine& line) {
+    line.add("url", url).add("file", path).add("bytes", std::uint64_t{request.body.size()});
+    addResult(line, result);
+  });
+  if (result.response) {
+    _account->finish(1, answerOf(result));
+    return takeAnswer(path, result.data.bytes());
+  }
+  _account->drop(DropReason::UploadFailed);
   asl_log(_platform.log, LogLevel::Error, "Tally(uploadFileAtPath): post {}",
           result.error.value_or("(null)"));
 }

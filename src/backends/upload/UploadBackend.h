@@ -14,6 +14,8 @@ namespace tallyd {
 /// Posts a file in one synchronous request and deletes it when the server's answer has the word "success" in
 /// it, whatever its status. Messages and flushes pass it by.
 ///
+/// Books: files; one is sent when the server has answered, with whatever status.
+///
 /// Keeps nothing between uploads. During one it holds the file and its compressed copy, during the request
 /// the copy alone. Threading: the session's queue; an upload counts as blocking from its first read on.
 class UploadBackend final : public TallyBackend {
@@ -25,6 +27,8 @@ class UploadBackend final : public TallyBackend {
   [[nodiscard]] static std::shared_ptr<UploadBackend> initWithName(
       const platform::Platform& platform, std::string_view name, const Payload& profile,
       const std::optional<std::string>& productFamily);
+
+  [[nodiscard]] std::string_view kind() const override { return "upload"; }
 
   /// True when a request was sent, whatever became of it. An answer that is no UTF-8 has no words in it.
   bool uploadFileAtPath(std::string_view path, std::string_view extensionToken) override;

@@ -99,6 +99,7 @@ void TransferEngine::submit(HTTPRequest request, std::shared_ptr<SerialQueue> qu
                                  : fmt::format("too many unfinished requests, which may hold {} bytes",
                                                _environment.limits.maximumPendingBytes);
   HTTPResult result = failedRequest(waiting.request, reason);
+  if (answer == Inbox::Answer::Full) result.failure = HTTPFailure::TooMuchWaits;
   waiting.client.heldBytes = 0;
   tell(std::move(waiting.client), std::move(result));
 }

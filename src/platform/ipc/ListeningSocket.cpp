@@ -19,6 +19,7 @@ namespace {
 
 constexpr int kBacklog = 4096;       ///< Linux's default upper limit (net.core.somaxconn).
 constexpr mode_t kEverybody = 0666;  ///< Every local program may report.
+constexpr mode_t kOwnersOnly = 0600;
 
 [[noreturn]] void fail(const std::string& what, const std::filesystem::path& path) {
   throw std::system_error(errno, std::system_category(), what + " " + path.string());
@@ -45,7 +46,7 @@ FileDescriptor socketOfServiceManager() {
   return {};
 }
 
-FileDescriptor newSocket(const std::filesystem::path& path) {
+FileDescriptor newSocket(const std::filesystem::path& path, mode_t mode) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   const std::string name = path.string();
@@ -59,7 +60,7 @@ FileDescriptor newSocket(const std::filesystem::path& path) {
   if (!socket) fail("cannot make a socket for", path);
   if (::unlink(address.sun_path) != 0 && errno != ENOENT) fail("cannot replace", path);
   if (::bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
-      ::chmod(address.sun_path, kEverybody) != 0 || ::listen(socket.get(), kBacklog) != 0) {
+      ::chmod(address.sun_path, mode) != 0 || ::listen(socket.get(), kBacklog) != 0) {
     fail("cannot listen on", path);
   }
   return socket;
@@ -67,12 +68,12 @@ FileDescriptor newSocket(const std::filesystem::path& path) {
 
 }  // namespace
 
-ListeningSocket::ListeningSocket(const std::filesystem::path& path) : _path(path) {
+ListeningSocket::ListeningSocket(const std::filesystem::path& path, SocketAccess access) : _path(path) {
   std::filesystem::create_directories(path.parent_path());
   _lock = lockFor(path);
-  _socket = socketOfServiceManager();
+  if (access == SocketAccess::Everybody) _socket = socketOfServiceManager();
   if (_socket) return;
-  _socket = newSocket(path);
+  _socket = newSocket(path, access == SocketAccess::Everybody ? kEverybody : kOwnersOnly);
   _ownsFile = true;
 }
 

@@ -10,7 +10,6 @@
 
 #include "platform/Log.h"
 #include "platform/SerialQueue.h"
-#include "platform/ipc/ListeningSocket.h"
 #include "platform/ipc/SdBusServiceConnection.h"
 
 namespace tallyd::platform {
@@ -24,8 +23,8 @@ constexpr std::chrono::milliseconds kPauseWithoutResources{250};
 
 class SdBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
  public:
-  Acceptor(const std::filesystem::path& socketPath, Queues& queues, Log& log)
-      : _socket(socketPath),
+  Acceptor(const std::filesystem::path& socketPath, Queues& queues, Log& log, SocketAccess access)
+      : _socket(socketPath, access),
         _log(log),
         _queue(queues.makeSerialQueue("com.quillon.tallyd.listener")),
         _shared(std::make_shared<SdBusServiceConnection::Shared>(queues)) {}
@@ -87,8 +86,9 @@ class SdBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
   std::uint64_t _accepted = 0;
 };
 
-SdBusListener::SdBusListener(const std::filesystem::path& socketPath, Queues& queues, Log& log)
-    : _acceptor(std::make_shared<Acceptor>(socketPath, queues, log)) {}
+SdBusListener::SdBusListener(const std::filesystem::path& socketPath, Queues& queues, Log& log,
+                             SocketAccess access)
+    : _acceptor(std::make_shared<Acceptor>(socketPath, queues, log, access)) {}
 
 SdBusListener::~SdBusListener() { _acceptor->stop(); }
 

@@ -5,6 +5,7 @@
 #include <memory>
 
 #include "platform/IPC.h"
+#include "platform/ipc/ListeningSocket.h"
 
 namespace tallyd::platform {
 
@@ -20,7 +21,8 @@ class SdBusListener final : public Listener {
  public:
   /// Makes the socket's folder and takes the socket (see ListeningSocket for what it throws). Borrows queues
   /// and log.
-  SdBusListener(const std::filesystem::path& socketPath, Queues& queues, Log& log);
+  SdBusListener(const std::filesystem::path& socketPath, Queues& queues, Log& log,
+                SocketAccess access = SocketAccess::Everybody);
   ~SdBusListener() override;
   SdBusListener(const SdBusListener&) = delete;
   SdBusListener& operator=(const SdBusListener&) = delete;

@@ -13,6 +13,18 @@
 
 namespace tallyd::platform {
 
+namespace {
+
+/// Who connected, at the time of connect(2).
+std::optional<ucred> peerOf(int socket) {
+  ucred peer{};
+  socklen_t size = sizeof peer;
+  if (getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &peer, &size) != 0) return std::nullopt;
+  return peer;
+}
+
+}  // namespace
+
 /// A call under way. The library's message is kept as long as it may be answered.
 class SdBusServiceConnection::Call final : public IncomingCall {
  public:
@@ -65,10 +77,13 @@ SdBusServiceConnection::~SdBusServiceConnection() {
 }
 
 std::string SdBusServiceConnection::description() const {
-  ucred peer{};
-  socklen_t size = sizeof peer;
-  if (getsockopt(descriptor(), SOL_SOCKET, SO_PEERCRED, &peer, &size) != 0) return "client";
-  return fmt::format("client of process {}, user {}", peer.pid, peer.uid);
+  const auto peer = peerOf(descriptor());
+  return peer ? fmt::format("client of process {}, user {}", peer->pid, peer->uid) : "client";
+}
+
+std::optional<uid_t> SdBusServiceConnection::peerUser() const {
+  const auto peer = peerOf(descriptor());
+  return peer ? std::optional(peer->uid) : std::nullopt;
 }
 
 void SdBusServiceConnection::setExportedInterface(const Interface& exported) {

@@ -32,6 +32,7 @@ class SdBusServiceConnection final : public ServiceConnection, public BusConnect
   ~SdBusServiceConnection() override;
 
   [[nodiscard]] std::string description() const override;
+  [[nodiscard]] std::optional<uid_t> peerUser() const override;
   void setExportedInterface(const Interface& exported) override;
   void setExportedObject(std::shared_ptr<ExportedObject> object) override;
   void setInterruptionHandler(std::function<void()> handler) override;

@@ -224,5 +224,28 @@ TEST_F(PithBackendTest, SurvivesAnAdaptorThatCannotBeMade) {
   expectNoResponse(*backend, "(null)");
 }
 
+void throwAlways(void*, std::uint16_t, std::uint16_t, const void*, std::size_t) {
+  throw std::runtime_error("not today");
+}
+
+TEST_F(PithBackendTest, BooksWhatTheAdaptorTookAndWhyItTookNothing) {
+  static constexpr PithAdaptorClass kThrowing{1, create, destroy, throwAlways};
+  static constexpr PithAdaptorClass kDeaf{1, create, destroy, nullptr};
+  const auto whole = madeWith(kWhole);
+  whole->sendMessage(Dictionary{{"a", 1}}, kTime, 1, 0);
+  whole->sendMessage(std::nullopt, kTime, 1, 0);
+  EXPECT_EQ(whole->account().counts().sent, 2U);
+  EXPECT_EQ(received.size(), 2U);
+  const auto throwing = madeWith(kThrowing);
+  throwing->sendMessage(Dictionary{{"a", 1}}, kTime, 1, 0);
+  EXPECT_EQ(*throwing->account().counts().dictionary().dictionary("dropped"),
+            (Dictionary{{"adaptor-threw", 1}}));
+  const auto deaf = madeWith(kDeaf);
+  deaf->sendMessage(Dictionary{{"a", 1}}, kTime, 1, 0);
+  EXPECT_EQ(*deaf->account().counts().dictionary().dictionary("dropped"),
+            (Dictionary{{"adaptor-unavailable", 1}}));
+  for (const auto& backend : {whole, throwing, deaf}) EXPECT_TRUE(backend->account().counts().isBalanced());
+}
+
 }  // namespace
 }  // namespace tallyd

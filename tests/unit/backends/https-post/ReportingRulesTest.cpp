@@ -232,5 +232,44 @@ TEST(ReportingRulesTest, IsOffWithoutConsentForEveryOtherOverride) {
   }
 }
 
+// The trace
+
+TEST(ReportingTraceTest, FollowsTheRulesUpToTheFirstRefusal) {
+  using enum ReportingRule;
+  Dictionary unfiltered = entry("any", "video");
+  unfiltered.remove("filters");
+  const auto facts = circumstances({entry("other", "x"), unfiltered}, userInfo("any"));
+  ReportingTrace trace;
+  EXPECT_EQ(decideReporting(facts, &trace).reason, ReportingReason::NoFilters);
+  EXPECT_EQ(trace, (ReportingTrace{{UserInfoNotRequired, false},
+                                   {UserInfo, true},
+                                   {ClientList, true},
+                                   {ClientEntry, false, 0},
+                                   {ClientEntry, true, 1},
+                                   {Consent, true, 1},
+                                   {Locale, true, 1},
+                                   {Device, true, 1},
+                                   {Filters, false, 1}}));
+}
+
+TEST(ReportingTraceTest, EndsWithSamplingWhereNothingElseRefuses) {
+  ReportingTrace trace;
+  auto facts = circumstances({entry("any", "video")}, userInfo("any"));
+  EXPECT_EQ(decideReporting(facts, &trace).state, ReportingStateOn);
+  EXPECT_EQ(trace.back(), (ReportingStep{ReportingRule::Sampling, true, 0}));
+  facts.samplingFactor = 2;
+  trace.clear();
+  EXPECT_EQ(decideReporting(facts, &trace).state, ReportingStateOff);
+  EXPECT_EQ(trace.back(), (ReportingStep{ReportingRule::Sampling, false, 0}));
+}
+
+TEST(ReportingTraceTest, HasOneStepWhereNoUserInfoIsRequired) {
+  auto facts = circumstances({}, userInfo("any"));
+  facts.requireUserInfo = false;
+  ReportingTrace trace;
+  EXPECT_EQ(decideReporting(facts, &trace).state, ReportingStateOn);
+  EXPECT_EQ(trace, (ReportingTrace{{ReportingRule::UserInfoNotRequired, true}}));
+}
+
 }  // namespace
 }  // namespace tallyd

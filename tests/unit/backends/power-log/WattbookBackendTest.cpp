@@ -73,5 +73,18 @@ TEST_F(WattbookBackendTest, NeedsNoProfileAndReportsAlways) {
   EXPECT_EQ(bare->flushMessages(), std::nullopt);
 }
 
+TEST_F(WattbookBackendTest, BooksWhatItRecordsAndWhatItDoesNot) {
+  send(Dictionary{{"a", 1}}, 1);
+  send(Dictionary{{"a", 1}}, 0);
+  send(std::nullopt, 0);
+  send(std::nullopt, 1);
+  send(Dictionary(), 1);
+  const auto counts = backend->account().counts();
+  EXPECT_EQ(counts.accepted, 5U);
+  EXPECT_EQ(counts.sent, fake.powerLog.events().size());
+  EXPECT_EQ(*counts.dictionary().dictionary("dropped"), (Dictionary{{"no-method", 2}, {"no-payload", 2}}));
+  EXPECT_TRUE(counts.isBalanced());
+}
+
 }  // namespace
 }  // namespace tallyd

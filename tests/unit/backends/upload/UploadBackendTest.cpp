@@ -269,5 +269,24 @@ TEST_F(UploadBackendTest, SendsTheDeviceIDThatItHas) {
   EXPECT_TRUE(requests[1].url.starts_with(std::string(kURL) + "?uuid=(null)&sequence=42&"));
 }
 
+TEST_F(UploadBackendTest, BooksEachFileOnceAndMessagesNotAtAll) {
+  backend->sendMessage(platform::Dictionary{{"a", 1}}, timeval{1, 2}, 3, 0);
+  backend->uploadLogData({});
+  EXPECT_EQ(backend->account().counts().passedBy, 2U);
+  answerWith("no word of it", 500);
+  EXPECT_TRUE(upload(write("file", "text")));
+  EXPECT_EQ(backend->account().counts().refused, 1U);
+  EXPECT_FALSE(upload(fake.folder.path() / "missing"));
+  EXPECT_FALSE(upload(write("empty", "")));
+  fake.http.answer = [](const HTTPRequest&) { return FakeHTTPClient::failure("refused"); };
+  EXPECT_TRUE(upload(write("file", "text")));
+  const auto counts = backend->account().counts();
+  EXPECT_EQ(counts.accepted, 4U);
+  EXPECT_EQ(counts.sent, 1U);
+  EXPECT_EQ(*counts.dictionary().dictionary("dropped"),
+            (platform::Dictionary{{"not-uploadable", 2}, {"upload-failed", 1}}));
+  EXPECT_TRUE(counts.isBalanced());
+}
+
 }  // namespace
 }  // namespace tallyd
