@@ -5,6 +5,7 @@
 #include <limits>
 
 #include "platform/JSON.h"
+#include "tallyctl/StrictJSON.h"
 
 namespace tallyd::tallyctl {
 
@@ -61,7 +62,7 @@ Parsed<Message> readMessage(const Dictionary& dictionary) {
 }  // namespace
 
 Parsed<Message> messageFromJSON(std::string_view text) {
-  auto json = platform::valueFromJSON(text);
+  auto json = valueFromStrictJSON(text);
   if (!json.value) return {{}, std::move(json.error)};
   if (!json.value->dictionary()) return {{}, R"(not an object with "category", "type" and "payload")"};
   return readMessage(*json.value->dictionary());
@@ -77,8 +78,8 @@ Parsed<Dictionary::Entry> parseAssignment(std::string_view text) {
   const std::string_view value = text.substr(sign + 1);
   if (key.empty()) return {{}, fmt::format("\"{}\" has no key", text)};
   if (!isJSON) return {Dictionary::Entry{std::string(key), readPlainValue(value)}, {}};
-  auto json = platform::valueFromJSON(value);
-  if (!json.value) return {{}, fmt::format("the value of \"{}\" is not JSON: {}", key, json.error)};
+  auto json = valueFromStrictJSON(value);
+  if (!json.value) return {{}, fmt::format("the value of \"{}\" is no usable JSON: {}", key, json.error)};
   return {Dictionary::Entry{std::string(key), std::move(*json.value)}, {}};
 }
 

@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "platform/Value.h"
+#include "tallyctl/Parsed.h"
 
 namespace tallyd::tallyctl {
 
@@ -18,15 +19,8 @@ struct Message {
   bool operator==(const Message&) const = default;
 };
 
-/// What was read, or why it could not be.
-template <class T>
-struct Parsed {
-  std::optional<T> value;
-  std::string error;  ///< Empty when there is a value.
-};
-
 /// Reads {"category": N, "type": N, "payload": {…}}; the payload may be missing or null, any other key is an
-/// error, so that a misspelt one is noticed.
+/// error, so that a misspelt one is noticed, and so is a key that comes twice.
 [[nodiscard]] Parsed<Message> messageFromJSON(std::string_view text);
 
 /// Reads KEY=VALUE or KEY:=JSON. A VALUE that is a boolean or a number as JSON writes it becomes one, every

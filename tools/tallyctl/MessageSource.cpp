@@ -1,11 +1,8 @@
 #include "tallyctl/MessageSource.h"
 
-#include <fcntl.h>
 #include <fmt/format.h>
-#include <sys/stat.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <system_error>
 #include <utility>
 
@@ -13,28 +10,12 @@ namespace tallyd::tallyctl {
 
 namespace {
 
-platform::FileDescriptor openFile(const std::string& path) {
-  if (path == "-") return {};
-  platform::FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  if (!file) throw std::system_error(errno, std::generic_category(), path);
-  return file;
-}
-
-std::uint64_t lengthOf(int descriptor) {
-  struct stat status {};
-  if (::fstat(descriptor, &status) != 0 || !S_ISREG(status.st_mode)) return 0;
-  return static_cast<std::uint64_t>(status.st_size);
-}
-
 bool isBlank(const std::string& line) { return line.find_first_not_of(" \t\r") == std::string::npos; }
 
 }  // namespace
 
 MessageSource::MessageSource(const std::string& path, int standardInput)
-    : _name(path == "-" ? "standard input" : path),
-      _file(openFile(path)),
-      _lines(_file ? _file.get() : standardInput),
-      _lengthBytes(lengthOf(_file ? _file.get() : standardInput)) {}
+    : _input(path, standardInput), _lines(_input.descriptor()) {}
 
 std::optional<std::variant<Message, MessageSource::Fault>> MessageSource::next() {
   using Status = LineReader::Status;
@@ -42,7 +23,7 @@ std::optional<std::variant<Message, MessageSource::Fault>> MessageSource::next()
   while (status == Status::Line && isBlank(_line)) status = nextLine();
   if (status == Status::End) return std::nullopt;
   const auto fault = [this](std::string_view text) {
-    return Fault{fmt::format("{}: {}", placeOf(lineNumber()), text)};
+    return Fault{placeOf(lineNumber()), std::string(text)};
   };
   if (status == Status::TooLong) {
     return fault(fmt::format("longer than {} bytes", LineReader::kMaximumLineBytes));
@@ -53,12 +34,12 @@ std::optional<std::variant<Message, MessageSource::Fault>> MessageSource::next()
 }
 
 std::string MessageSource::placeOf(std::uint64_t lineNumber) const {
-  return fmt::format("{}:{}", _name, lineNumber);
+  return fmt::format("{}:{}", _input.name(), lineNumber);
 }
 
 std::optional<double> MessageSource::share() const {
-  if (_lengthBytes == 0) return std::nullopt;
-  return std::min(1.0, static_cast<double>(_lines.bytesRead()) / static_cast<double>(_lengthBytes));
+  if (_input.lengthBytes() == 0) return std::nullopt;
+  return std::min(1.0, static_cast<double>(_lines.bytesRead()) / static_cast<double>(_input.lengthBytes()));
 }
 
 LineReader::Status MessageSource::nextLine() {

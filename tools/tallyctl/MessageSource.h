@@ -6,7 +6,7 @@
 #include <string>
 #include <variant>
 
-#include "platform/FileDescriptor.h"
+#include "tallyctl/Input.h"
 #include "tallyctl/LineReader.h"
 #include "tallyctl/Message.h"
 
@@ -16,10 +16,12 @@ namespace tallyd::tallyctl {
 class MessageSource {
  public:
   struct Fault {
-    std::string text;  ///< "FILE:LINE: what is wrong".
+    std::string place;  ///< "FILE:LINE".
+    std::string text;   ///< What is wrong.
   };
 
-  /// Opens `path`; "-" is `standardInput`, which is borrowed. Throws std::system_error that names the file.
+  /// Opens `path`; "-" is `standardInput`, which is borrowed. Throws std::system_error that names the file,
+  /// for a folder too.
   MessageSource(const std::string& path, int standardInput);
 
   /// The next message, or what is wrong with the next line, which is then passed over; nothing at the end.
@@ -37,10 +39,8 @@ class MessageSource {
  private:
   LineReader::Status nextLine();
 
-  const std::string _name;
-  const platform::FileDescriptor _file;  ///< Empty for the standard input.
+  const Input _input;
   LineReader _lines;
-  std::uint64_t _lengthBytes = 0;  ///< 0 when not known.
   std::string _line;
 };
 

@@ -4,12 +4,12 @@
 namespace tallyd::tallyctl {
 
 inline constexpr const char* kAppText =
-    "Talks to the reporting daemon tallyd: reports messages, shows states.";
+    "Talks to the reporting daemon tallyd: reports messages, uploads files, shows states.";
 inline constexpr const char* kAppFooter = R"(
 Example, two messages from a file:
   tallyctl report --client-name demo --service-name calls --messages messages.jsonl
 
-Exit status: 0 everything worked; 1 something failed; 2 wrong usage.
+Exit status: 0 everything worked; 1 something failed; 2 wrong usage; 141 nobody reads the output.
 "tallyctl COMMAND --help" shows an example of each command. See tallyctl(1).)";
 
 inline constexpr const char* kClientTypeText =
@@ -54,6 +54,29 @@ sessions have batched. Use "report --flush-every" to flush what is being reporte
 Example:
   tallyctl flush --client-type 5 --batch)";
 
+inline constexpr const char* kDisplayURLText = "Starts a session and prints the URL that shows its reports";
+inline constexpr const char* kDisplayURLFooter = R"(
+Fails when there is none. The URL names the session, so that --session-id asks for that of another one.
+
+Example:
+  tallyctl display-url --session-id 42)";
+
+inline constexpr const char* kUploadText = "Uploads a file";
+inline constexpr const char* kUploadFooter = R"(
+Waits until the daemon has sent the file, which need not mean that the server took it: a file that the server
+confirms is removed where the daemon may do so. A large file may need a longer --timeout.
+
+Example:
+  tallyctl --timeout 600 upload --session-id 42 /var/mobile/call.log)";
+
+inline constexpr const char* kUploadLogText = "Uploads log data";
+inline constexpr const char* kLogFilesText =
+    "Files with log data: a property list or JSON (one element of the\n"
+    "data each), or JSON lines (one element a line); - is the standard input";
+inline constexpr const char* kUploadLogFooter = R"(
+Example:
+  tallyctl upload-log states.plist events.jsonl)";
+
 inline constexpr const char* kWatchText = "Samples this machine and reports each sample, until stopped";
 inline constexpr const char* kWatchFooter = R"(
 Reports the use of processors, memory, disks and network as quality samples (category 1, type 0) through one
@@ -62,5 +85,28 @@ session of client type 5. SIGINT and SIGTERM flush the session and end it in ord
 Examples:
   tallyctl watch
   tallyctl watch --interval 5 --count 12 --json)";
+
+inline constexpr const char* kInspectionSocketText =
+    "The socket that stats and tap use, in place of the one below the root";
+
+inline constexpr const char* kStatsText = "Shows what the daemon took and what became of it";
+inline constexpr const char* kStatsFooter = R"(
+For each session and backend, for the sessions that have ended and in total: what was accepted is what was sent,
+is held or under way, or was dropped for one of the reasons that follow. Of what was sent, the servers refused
+some. Fails when something does not balance. For root and the daemon's own user.
+
+Examples:
+  tallyctl stats
+  tallyctl stats --json)";
+
+inline constexpr const char* kTapText = "Shows what leaves the daemon, until stopped";
+inline constexpr const char* kTapFooter = R"(
+Posts with their documents and results, datagrams, uploads, records, and whatever is dropped, of all sessions.
+Who reads too slowly misses lines and is told how many; the daemon does not wait. For root and the daemon's own
+user.
+
+Examples:
+  tallyctl tap
+  tallyctl tap --json | grep '"kind":"drop"')";
 
 }  // namespace tallyd::tallyctl

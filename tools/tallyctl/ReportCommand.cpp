@@ -37,20 +37,29 @@ class Report {
         _progressTicks(std::chrono::steady_clock::now(), kProgressInterval),
         _sender(session.connection(), [this](const MessageSender::Answer& answer) { tell(answer); }) {}
 
-  /// False when anything failed.
-  bool run() {
+  struct Outcome {
+    std::uint64_t sent = 0;
+    std::uint64_t failed = 0;          ///< Lines and messages.
+    std::optional<std::string> error;  ///< Nothing when nothing failed.
+  };
+
+  Outcome run() {
     if (_options.message) send(0, *_options.message);
     if (_source) sendAll();
     if (!_session.lost()) _sender.flush(_source ? _source->lineNumber() : 0);
     const auto totals = _sender.drain();
     _console.clearProgress();
+    Outcome outcome{totals.sent, totals.failed + _faultyLines, std::nullopt};
     if (_session.lost()) {
-      tellLoss();
+      outcome.error = lossText();
+      _console.complain(*outcome.error);
     } else {
       tellFailures();
+      if (outcome.failed > 0 || totals.failedFlushes > 0) {
+        outcome.error = fmt::format("{} messages, {} flushes failed", outcome.failed, totals.failedFlushes);
+      }
     }
-    _console.print(fmt::format("sent {} messages, {} failed", totals.sent, totals.failed + _faultyLines));
-    return !totals.anyFailed() && _faultyLines == 0 && !_session.lost();
+    return outcome;
   }
 
  private:
@@ -62,7 +71,8 @@ class Report {
         send(_source->lineNumber(), std::move(*message));
       } else {
         ++_faultyLines;
-        _console.complain(std::get<MessageSource::Fault>(*next).text);
+        const auto& fault = std::get<MessageSource::Fault>(*next);
+        tellFailure(fault.place, fault.text);
       }
       showProgress();
     }
@@ -88,7 +98,8 @@ class Report {
     }
     tellFailures();
     if (!answer.reply.value.value_or("").empty()) {
-      _console.print(fmt::format("{}: {}", subjectOf(answer), *answer.reply.value));
+      _console.tell(fmt::format("{}: {}", subjectOf(answer), *answer.reply.value),
+                    {{"subject", subjectOf(answer)}, {"result", *answer.reply.value}});
     }
   }
 
@@ -98,20 +109,23 @@ class Report {
   }
 
   void tellFailures() {
-    for (const auto& failure : std::exchange(_failures, {})) {
-      _console.complain(fmt::format("{}: {}", failure.subject, failure.error));
-    }
+    for (const auto& failure : std::exchange(_failures, {})) tellFailure(failure.subject, failure.error);
+  }
+
+  void tellFailure(const std::string& subject, const std::string& error) {
+    _console.complain(fmt::format("{}: {}", subject, error));
+    if (_console.isJSON()) _console.printObject({{"subject", subject}, {"error", error}});
   }
 
   /// When the daemon goes, everything under way fails at once, for this one reason.
-  void tellLoss() {
+  [[nodiscard]] std::string lossText() const {
     std::string text = _session.lostText();
     const auto first = std::min_element(_failures.begin(), _failures.end(),
                                         [](const auto& a, const auto& b) { return a.number < b.number; });
     if (_source && first != _failures.end()) {
       text += fmt::format("; what was sent from {} on may be lost", _source->placeOf(first->number));
     }
-    _console.complain(text);
+    return text;
   }
 
   void showProgress() {
@@ -139,20 +153,30 @@ class Report {
   MessageSender _sender;  ///< Last, as its handler uses the rest.
 };
 
+int finish(const Report::Outcome& outcome, const std::optional<std::string>& noStorebag, Console& console) {
+  const auto error = outcome.error ? outcome.error : noStorebag;
+  platform::Dictionary result{
+      {"ok", !error}, {"sent", platform::Value(outcome.sent)}, {"failed", platform::Value(outcome.failed)}};
+  if (error) result.set("error", *error);
+  console.tell(fmt::format("sent {} messages, {} failed", outcome.sent, outcome.failed), result);
+  return error ? kFailed : kSucceeded;
+}
+
 }  // namespace
 
-int runReport(const ConnectionOptions& connection, const ReportOptions& options,
-              const Surroundings& surroundings, Console& console) {
+int runCommand(const ConnectionOptions& connection, const ReportOptions& options,
+               const Surroundings& surroundings, Console& console) {
   std::optional<MessageSource> source;
   if (options.messagesFile) source.emplace(*options.messagesFile, surroundings.standardInput);
   Session session(connection);
   const auto sessionID = options.session.sessionID.value_or(randomSessionID());
   const auto states = session.start(options.session, sessionID, userInfo(options.session));
-  console.print(fmt::format("session {}", sessionID));
-  console.print("states: " + statesText(states));
-  if (!states) console.complain(noStorebagText(options.session.clientType));
-  const bool succeeded = Report(session, options, source, console).run();
-  return succeeded && states ? kSucceeded : kFailed;
+  console.tell(fmt::format("session {}\nstates: {}", sessionID, statesText(states)),
+               {{"session", platform::Value(sessionID)}, {"states", statesValue(states)}});
+  std::optional<std::string> noStorebag;
+  if (!states) noStorebag = noStorebagText(options.session.clientType);
+  if (noStorebag) console.complain(*noStorebag);
+  return finish(Report(session, options, source, console).run(), noStorebag, console);
 }
 
 }  // namespace tallyd::tallyctl

@@ -8,15 +8,22 @@
 
 namespace tallyd::tallyctl {
 
+using platform::Dictionary;
+using platform::Value;
+
 namespace {
 
 constexpr std::string_view kFinished = "finished";  ///< The daemon's reply to a one-shot send that it made.
+constexpr std::string_view kNoDisplayURL = "URL not available";  ///< The daemon's reply in place of a URL.
 
 std::uint32_t sessionIDOf(const SessionOptions& options) {
   return options.sessionID.value_or(randomSessionID());
 }
 
-void printStates(const std::optional<Strings>& states, Console& console) {
+/// What of it is the command's result is for the caller to say, with a further entry.
+void printStates(const std::optional<Strings>& states, Console& console, Dictionary object) {
+  object.set("states", statesValue(states));
+  if (console.isJSON()) return console.printObject(object);
   if (!states) return console.print(statesText(states));
   if (states->empty()) return console.note("no backend reports");
   for (const auto& name : *states) console.print(name);
@@ -27,8 +34,8 @@ void printStates(const std::optional<Strings>& states, Console& console) {
 }
 
 /// What the options say, and the lines of the standard input up to its end over it.
-platform::Dictionary awaitUserInfo(const SessionOptions& options, int standardInput) {
-  platform::Dictionary info = userInfo(options).value_or(platform::Dictionary());
+Dictionary awaitUserInfo(const SessionOptions& options, int standardInput) {
+  Dictionary info = userInfo(options).value_or(Dictionary());
   LineReader lines(standardInput);
   std::string line;
   while (true) {
@@ -44,38 +51,56 @@ platform::Dictionary awaitUserInfo(const SessionOptions& options, int standardIn
 
 }  // namespace
 
-int runOnce(const ConnectionOptions& connection, const OnceOptions& options, Console& console) {
+int runCommand(const ConnectionOptions& connection, const OnceOptions& options, const Surroundings&,
+               Console& console) {
   Session session(connection);
   const auto& [category, type, payload] = options.message;
   const auto reply =
       session.answer("the one-shot send", session.connection().sendMessageWithSessionInfoSync(
                                               sessionInfo(options.session, sessionIDOf(options.session)),
                                               userInfo(options.session), category, type, payload));
-  console.print(reply);
-  return reply == kFinished ? kSucceeded : kFailed;
+  const bool succeeded = reply == kFinished;
+  Dictionary result{{"ok", succeeded}, {"reply", reply}};
+  if (!succeeded) result.set("error", reply);
+  console.tell(reply, result);
+  return succeeded ? kSucceeded : kFailed;
 }
 
-int runStates(const ConnectionOptions& connection, const StatesOptions& options,
-              const Surroundings& surroundings, Console& console) {
+int runCommand(const ConnectionOptions& connection, const StatesOptions& options,
+               const Surroundings& surroundings, Console& console) {
   Session session(connection);
   const bool waits = options.waitForUserInfo;
   const auto states = session.start(options.session, sessionIDOf(options.session),
                                     waits ? std::nullopt : userInfo(options.session));
-  printStates(states, console);
+  const Dictionary succeeded{{"ok", true}};
+  printStates(states, console, waits ? Dictionary() : succeeded);
   if (!waits) return kSucceeded;
   auto info = awaitUserInfo(options.session, surroundings.standardInput);
   printStates(session.answer("fetching the states", session.connection().fetchStatesSync(std::move(info))),
-              console);
+              console, succeeded);
   return kSucceeded;
 }
 
-int runFlush(const ConnectionOptions& connection, const FlushOptions& options, Console& console) {
+int runCommand(const ConnectionOptions& connection, const FlushOptions& options, const Surroundings&,
+               Console& console) {
   Session session(connection);
   const auto states = session.start(options.session, sessionIDOf(options.session), userInfo(options.session));
   if (!states) console.complain(noStorebagText(options.session.clientType));
-  const auto result = session.answer("the flush", session.connection().flushMessagesSync());
-  console.print(result.value_or("no result"));
+  const auto text = session.answer("the flush", session.connection().flushMessagesSync());
+  Dictionary result{{"ok", states.has_value()}, {"result", text ? Value(*text) : Value()}};
+  if (!states) result.set("error", noStorebagText(options.session.clientType));
+  console.tell(text.value_or("no result"), result);
   return states ? kSucceeded : kFailed;
+}
+
+int runCommand(const ConnectionOptions& connection, const DisplayURLOptions& options, const Surroundings&,
+               Console& console) {
+  Session session(connection);
+  session.start(options.session, sessionIDOf(options.session), userInfo(options.session));
+  const auto url = session.answer("fetching the display URL", session.connection().fetchDisplayURLSync());
+  if (url == kNoDisplayURL) throw Failure(url);
+  console.tell(url, {{"ok", true}, {"url", url}});
+  return kSucceeded;
 }
 
 }  // namespace tallyd::tallyctl

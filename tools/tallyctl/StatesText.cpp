@@ -10,6 +10,11 @@ std::string statesText(const std::optional<std::vector<std::string>>& states) {
   return fmt::format("{}", fmt::join(*states, ", "));
 }
 
+platform::Value statesValue(const std::optional<std::vector<std::string>>& states) {
+  if (!states) return {};
+  return platform::Array(std::vector<platform::Value>(states->begin(), states->end()));
+}
+
 std::string noStorebagText(std::int32_t clientType) {
   return fmt::format("the daemon has no storebag for client type {}: messages reach no backend", clientType);
 }

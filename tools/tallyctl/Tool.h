@@ -29,13 +29,25 @@ struct Surroundings {
 
 // One function for each command; what they throw, runTool() reports.
 
-int runReport(const ConnectionOptions& connection, const ReportOptions& options,
-              const Surroundings& surroundings, Console& console);
-int runOnce(const ConnectionOptions& connection, const OnceOptions& options, Console& console);
-int runStates(const ConnectionOptions& connection, const StatesOptions& options,
-              const Surroundings& surroundings, Console& console);
-int runFlush(const ConnectionOptions& connection, const FlushOptions& options, Console& console);
-int runWatch(const ConnectionOptions& connection, const WatchOptions& options,
-             const Surroundings& surroundings, Console& console);
+int runCommand(const ConnectionOptions& connection, const ReportOptions& options,
+               const Surroundings& surroundings, Console& console);
+int runCommand(const ConnectionOptions& connection, const OnceOptions& options,
+               const Surroundings& surroundings, Console& console);
+int runCommand(const ConnectionOptions& connection, const StatesOptions& options,
+               const Surroundings& surroundings, Console& console);
+int runCommand(const ConnectionOptions& connection, const FlushOptions& options,
+               const Surroundings& surroundings, Console& console);
+int runCommand(const ConnectionOptions& connection, const DisplayURLOptions& options,
+               const Surroundings& surroundings, Console& console);
+int runCommand(const ConnectionOptions& connection, const UploadOptions& options,
+               const Surroundings& surroundings, Console& console);
+int runCommand(const ConnectionOptions& connection, const UploadLogOptions& options,
+               const Surroundings& surroundings, Console& console);
+int runCommand(const ConnectionOptions& connection, const StatsOptions& options,
+               const Surroundings& surroundings, Console& console);
+int runCommand(const ConnectionOptions& connection, const TapOptions& options,
+               const Surroundings& surroundings, Console& console);
+int runCommand(const ConnectionOptions& connection, const WatchOptions& options,
+               const Surroundings& surroundings, Console& console);
 
 }  // namespace tallyd::tallyctl

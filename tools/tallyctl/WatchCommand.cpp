@@ -1,6 +1,5 @@
 #include <fmt/format.h>
 
-#include "platform/JSON.h"
 #include "tallyctl/MachineSample.h"
 #include "tallyctl/MessageSender.h"
 #include "tallyctl/ProcReader.h"
@@ -14,6 +13,11 @@ namespace {
 
 constexpr std::uint16_t kQualityCategory = 1;
 constexpr std::uint16_t kSampleType = 0;
+
+/// As JSON, the output holds samples alone as long as nothing fails.
+void tellBesideSamples(const std::string& text, Console& console) {
+  console.isJSON() ? console.note(text) : console.print(text);
+}
 
 /// Samples and sends until the count is reached, the pacer stops, or the daemon is gone.
 class Watch {
@@ -42,14 +46,13 @@ class Watch {
 
  private:
   [[nodiscard]] bool isEnough(std::uint64_t number) const {
-    return _session.lost() || (_options.count > 0 && number > _options.count);
+    return _session.lost() || _console.failed() || (_options.count > 0 && number > _options.count);
   }
 
   void report(const MachineSample& sample) {
     const auto payload = payloadOf(sample);
     _sender.send(sample.number, {kQualityCategory, kSampleType, payload});
-    // Every number of a sample is finite, so that there always is a text.
-    _console.print(_options.json ? platform::jsonFromValue(payload).value_or("") : lineOf(sample));
+    _console.tell(lineOf(sample), payload);
   }
 
   bool finish() {
@@ -57,8 +60,12 @@ class Watch {
     const auto totals = _sender.drain();
     if (_session.lost()) _console.complain(_session.lostText());
     const auto text = fmt::format("sent {} samples, {} failed", totals.sent, totals.failed);
-    _options.json ? _console.note(text) : _console.print(text);
-    return !totals.anyFailed() && !_session.lost();
+    tellBesideSamples(text, _console);
+    const bool succeeded = !totals.anyFailed() && !_session.lost();
+    if (!succeeded && _console.isJSON()) {
+      _console.printObject({{"ok", false}, {"error", _session.lost() ? _session.lostText() : text}});
+    }
+    return succeeded;
   }
 
   /// On the connection's thread.
@@ -79,14 +86,13 @@ class Watch {
 
 }  // namespace
 
-int runWatch(const ConnectionOptions& connection, const WatchOptions& options,
-             const Surroundings& surroundings, Console& console) {
+int runCommand(const ConnectionOptions& connection, const WatchOptions& options,
+               const Surroundings& surroundings, Console& console) {
   const auto pacer = surroundings.makePacer();
   Session session(connection);
   const auto sessionID = options.session.sessionID.value_or(randomSessionID());
   const auto states = session.start(options.session, sessionID, userInfo(options.session));
-  const auto text = fmt::format("session {}, states: {}", sessionID, statesText(states));
-  options.json ? console.note(text) : console.print(text);
+  tellBesideSamples(fmt::format("session {}, states: {}", sessionID, statesText(states)), console);
   if (!states) console.complain(noStorebagText(options.session.clientType));
   return Watch(session, options, surroundings.procFolder, *pacer, console).run() ? kSucceeded : kFailed;
 }

@@ -46,5 +46,20 @@ TEST_F(ConsoleTest, NoticesThatItsOutputIsNotTaken) {
   EXPECT_TRUE(console.failed());
 }
 
+TEST_F(ConsoleTest, TellsInTheFormThatIsAskedFor) {
+  const platform::Dictionary object{{"ok", true}, {"text", "a\n\"b\""}};
+  Console(_out, _err, Console::Progress::Hidden).tell("line", object);
+  Console(_out, _err, Console::Progress::Hidden, OutputForm::JSON).tell("line", object);
+  EXPECT_EQ(_out.str(), "line\n{\"ok\":true,\"text\":\"a\\n\\\"b\\\"\"}\n");
+}
+
+TEST_F(ConsoleTest, ShowsHowLongSomethingTakes) {
+  Console console(_out, _err, Console::Progress::Shown);
+  console.showElapsed("uploading a.log, 1.0 KiB", std::chrono::milliseconds(12'300));
+  console.clearProgress();
+  EXPECT_EQ(_err.str(), "uploading a.log, 1.0 KiB, 12 s\r\x1B[K");
+  EXPECT_EQ(_out.str(), "");
+}
+
 }  // namespace
 }  // namespace tallyd::tallyctl

@@ -1,5 +1,6 @@
 #include "tallyctl/MessageSource.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <unistd.h>
 
@@ -16,7 +17,7 @@ using Status = LineReader::Status;
 
 std::string faultOf(const std::optional<std::variant<Message, MessageSource::Fault>>& next) {
   const auto* fault = next ? std::get_if<MessageSource::Fault>(&*next) : nullptr;
-  return fault ? fault->text : "no fault";
+  return fault ? fault->place + ": " + fault->text : "no fault";
 }
 
 TEST(LineReaderTest, GivesEachLineWithoutItsLineFeed) {
@@ -107,15 +108,33 @@ TEST(MessageSourceTest, NamesTheFileThatItCannotOpen) {
   }
 }
 
-TEST(MessageSourceTest, NamesTheFileThatItCannotRead) {
+TEST(MessageSourceTest, RefusesAFolderBeforeItReads) {
   const fakes::TemporaryFolder folder;
-  MessageSource source(folder.path(), -1);
+  try {
+    MessageSource source(folder.path(), -1);
+    FAIL() << "took a folder";
+  } catch (const std::system_error& error) {
+    EXPECT_EQ(error.what(), folder.path().string() + ": Is a directory");
+  }
+}
+
+TEST(MessageSourceTest, NamesTheLineFromWhichItCannotReadOn) {
+  const fakes::TemporaryFolder folder;
+  const auto path = folder.path() / "written";
+  const platform::FileDescriptor writeOnly(::open(path.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600));
+  MessageSource source("-", writeOnly.get());
   try {
     source.next();
-    FAIL() << "read a folder";
+    FAIL() << "read what is open for writing";
   } catch (const std::system_error& error) {
-    EXPECT_EQ(error.what(), folder.path().string() + ":1: Is a directory");
+    EXPECT_STREQ(error.what(), "standard input:1: Bad file descriptor");
   }
+}
+
+TEST(MessageSourceTest, NamesLineAndKeyOfARepeatedKey) {
+  const InputFile input("\n{\"category\":1,\"type\":2,\"payload\":{\"a\":1,\"a\":2}}\n");
+  MessageSource source(input.path(), -1);
+  EXPECT_EQ(faultOf(source.next()), input.path().string() + ":2: the key \"a\" comes twice");
 }
 
 }  // namespace

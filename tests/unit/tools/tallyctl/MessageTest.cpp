@@ -53,6 +53,12 @@ TEST(MessageTest, PointsAtTheByteThatIsNoJSON) {
   EXPECT_FALSE(messageFromJSON("").value);
 }
 
+TEST(MessageTest, RefusesAnObjectWithARepeatedKey) {
+  EXPECT_EQ(messageFromJSON(R"({"type":0,"category":1,"type":0})").error, "the key \"type\" comes twice");
+  EXPECT_EQ(parseAssignment(R"(k:=[{"b":{"a":1,"a":1}}])").error,
+            "the value of \"k\" is no usable JSON: the key \"a\" comes twice");
+}
+
 TEST(MessageTest, GivesPlainValuesTheKindThatTheyLookLike) {
   EXPECT_EQ(valueIn("k=true"), Value(true));
   EXPECT_EQ(valueIn("k=false"), Value(false));
@@ -87,7 +93,7 @@ TEST(MessageTest, SaysWhatIsWrongWithAnAssignment) {
   EXPECT_EQ(parseAssignment("abc").error, "\"abc\" is neither KEY=VALUE nor KEY:=JSON");
   EXPECT_EQ(parseAssignment("=1").error, "\"=1\" has no key");
   EXPECT_EQ(parseAssignment(":=1").error, "\":=1\" has no key");
-  EXPECT_TRUE(parseAssignment("k:=[1").error.starts_with("the value of \"k\" is not JSON: "));
+  EXPECT_TRUE(parseAssignment("k:=[1").error.starts_with("the value of \"k\" is no usable JSON: "));
   EXPECT_FALSE(parseAssignment("k:=").value);
 }
 

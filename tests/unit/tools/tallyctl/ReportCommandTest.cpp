@@ -1,5 +1,7 @@
 #include <fmt/format.h>
+#include <gmock/gmock.h>
 
+#include <algorithm>
 #include <future>
 
 #include "CuttableRelay.h"
@@ -131,6 +133,50 @@ TEST_F(ReportCommandTest, NamesTheFileThatItCannotOpenBeforeItConnects) {
   EXPECT_EQ(run({"report", "--messages", "/nonexistent/file"}), kFailed);
   EXPECT_EQ(_err, "tallyctl: /nonexistent/file: No such file or directory\n");
   EXPECT_TRUE(_daemon.calls().empty());
+}
+
+TEST_F(ReportCommandTest, RefusesAFolderOfMessagesBeforeItConnects) {
+  EXPECT_EQ(run({"report", "--messages", _folder.path().string()}), kFailed);
+  EXPECT_EQ(_err, "tallyctl: " + _folder.path().string() + ": Is a directory\n");
+  EXPECT_TRUE(_daemon.calls().empty());
+}
+
+TEST_F(ReportCommandTest, TellsEverythingAsObjects) {
+  _daemon.script.sendResult = [](auto) { return "posted"; };
+  _daemon.script.flushResult = "flushed";
+  EXPECT_EQ(run({"--json", "report", "--session-id", "7", "--messages", "-"},
+                "{\"category\":1,\"type\":2}\n{\"type\":1}\n"),
+            kFailed);
+  // The faulty line may be told before or after the first message's answer.
+  EXPECT_THAT(
+      objects(),
+      testing::UnorderedElementsAre(
+          Dictionary{{"session", 7}, {"states", Array{"https_post", "dashboard"}}},
+          Dictionary{{"subject", "standard input:1"}, {"result", "posted"}},
+          Dictionary{{"subject", "standard input:2"}, {"error", "\"category\" is missing"}},
+          Dictionary{{"subject", "flush"}, {"result", "flushed"}},
+          Dictionary{{"ok", false}, {"sent", 1}, {"failed", 1}, {"error", "1 messages, 0 flushes failed"}}));
+  EXPECT_TRUE(objects().front().contains("session"));
+  EXPECT_TRUE(objects().back().contains("ok"));
+}
+
+TEST_F(ReportCommandTest, EndsWithAnObjectThatSaysThatAllWentWell) {
+  EXPECT_EQ(run({"report", "--json", "--category", "1", "--type", "2"}), kSucceeded);
+  EXPECT_EQ(objects().back(), (Dictionary{{"ok", true}, {"sent", 1}, {"failed", 0}}));
+  _daemon.script.states = std::nullopt;
+  EXPECT_EQ(run({"report", "--json", "--category", "1", "--type", "2"}), kFailed);
+  EXPECT_FALSE(objects().back().boolean("ok"));
+  EXPECT_EQ(objects().back().string("error"),
+            "the daemon has no storebag for client type 5: messages reach no backend");
+}
+
+TEST_F(ReportCommandTest, SendsEverythingThoughNobodyReadsItsOutput) {
+  FailingOutput output(0, EPIPE);
+  std::ostream out(&output);
+  const std::string line = "{\"category\":1,\"type\":2}\n";
+  EXPECT_EQ(runInto(out, {"report", "--messages", "-"}, line + line + line), kClosedPipe);
+  EXPECT_EQ(messages().size(), 3U);
+  EXPECT_EQ(_err, "");
 }
 
 TEST_F(ReportCommandTest, NamesTheSocketThatItCannotConnectTo) {

@@ -35,6 +35,10 @@ class ScriptedDaemon final : public platform::ListenerDelegate {
     bool holdsMessages = false;                       ///< Until the states are fetched.
     bool repliesToOnce = true;
     bool refusesClients = false;
+    std::string displayURL = "URL not available";
+    std::function<bool()> upload;  ///< The answer to an upload, a file's or log data's; without one it is no.
+    std::optional<std::string> uploadLogError;
+    bool repliesToUploads = true;
   };
 
   struct Call {
@@ -105,8 +109,13 @@ class ScriptedDaemon final : public platform::ListenerDelegate {
       case ClientSessionMethod::SendMessageWithSessionInfo:
         if (script.repliesToOnce) call->reply({Value(script.onceReply)});
         return;
-      default:
-        return call->rejectArguments("not in the script");
+      case ClientSessionMethod::FetchDisplayURL:
+        return call->reply({script.displayURL});
+      case ClientSessionMethod::UploadFileAtPath:
+        if (script.repliesToUploads) call->reply({script.upload && script.upload()});
+        return;
+      case ClientSessionMethod::UploadLogData:
+        return call->reply({script.upload && script.upload(), wrapped(script.uploadLogError)});
     }
   }
 

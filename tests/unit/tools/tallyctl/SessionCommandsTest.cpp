@@ -82,5 +82,74 @@ TEST_F(SessionCommandsTest, FlushFailsWithoutAStorebag) {
   EXPECT_EQ(_err, "tallyctl: the daemon has no storebag for client type 9: messages reach no backend\n");
 }
 
+TEST_F(SessionCommandsTest, DisplayURLPrintsTheURL) {
+  _daemon.script.displayURL = "https://show.example/?sequences=9&override=yes";
+  EXPECT_EQ(run({"display-url", "--session-id", "9"}), kSucceeded);
+  EXPECT_EQ(_out, "https://show.example/?sequences=9&override=yes\n");
+  const Value info = Dictionary{{"SessionID", 9}, {"ClientType", 5}};
+  EXPECT_EQ(_daemon.callsOf(Method::SetSessionInfo)[0].arguments[0], Value(Array{info}));
+  EXPECT_EQ(run({"display-url", "--json"}), kSucceeded);
+  EXPECT_EQ(objects(), (std::vector<Dictionary>{{{"ok", true}, {"url", _daemon.script.displayURL}}}));
+}
+
+TEST_F(SessionCommandsTest, DisplayURLFailsWhenThereIsNone) {
+  EXPECT_EQ(run({"display-url"}), kFailed);
+  EXPECT_EQ(_out, "");
+  EXPECT_EQ(_err, "tallyctl: URL not available\n");
+  EXPECT_EQ(run({"--json", "display-url"}), kFailed);
+  EXPECT_EQ(objects(), (std::vector<Dictionary>{{{"ok", false}, {"error", "URL not available"}}}));
+}
+
+TEST_F(SessionCommandsTest, PrintResultsAsObjects) {
+  EXPECT_EQ(run({"--json", "once", "--category", "2", "--type", "4"}), kSucceeded);
+  EXPECT_EQ(objects(), (std::vector<Dictionary>{{{"ok", true}, {"reply", "finished"}}}));
+  EXPECT_EQ(run({"--json", "states"}), kSucceeded);
+  EXPECT_EQ(objects(),
+            (std::vector<Dictionary>{{{"ok", true}, {"states", Array{"https_post", "dashboard"}}}}));
+  EXPECT_EQ(run({"--json", "states", "--wait-for-user-info"}, "a=1\n"), kSucceeded);
+  EXPECT_EQ(objects(), (std::vector<Dictionary>{{{"states", Array{"https_post", "dashboard"}}},
+                                                {{"ok", true}, {"states", Array{"https_post"}}}}));
+  EXPECT_EQ(run({"--json", "flush"}), kSucceeded);
+  EXPECT_EQ(objects(), (std::vector<Dictionary>{{{"ok", true}, {"result", nullptr}}}));
+}
+
+TEST_F(SessionCommandsTest, PrintFailuresAsObjects) {
+  _daemon.script.onceReply = "storebag not available";
+  EXPECT_EQ(run({"--json", "once", "--category", "2", "--type", "4"}), kFailed);
+  EXPECT_EQ(objects(),
+            (std::vector<Dictionary>{
+                {{"ok", false}, {"reply", "storebag not available"}, {"error", "storebag not available"}}}));
+  _daemon.script.states = std::nullopt;
+  _daemon.script.flushResult = "nothing";
+  EXPECT_EQ(run({"--json", "states"}), kSucceeded);
+  EXPECT_EQ(objects(), (std::vector<Dictionary>{{{"ok", true}, {"states", nullptr}}}));
+  EXPECT_EQ(run({"--json", "flush"}), kFailed);
+  ASSERT_EQ(objects().size(), 1U);
+  EXPECT_EQ(objects()[0].string("result"), "nothing");
+  EXPECT_EQ("tallyctl: " + std::string(objects()[0].string("error").value_or("")) + "\n", _err);
+  _socket = _folder.path() / "other";
+  EXPECT_EQ(run({"--json", "states"}), kFailed);
+  ASSERT_EQ(objects().size(), 1U);
+  EXPECT_FALSE(objects()[0].boolean("ok"));
+  EXPECT_EQ("tallyctl: " + std::string(objects()[0].string("error").value_or("")) + "\n", _err);
+}
+
+TEST_F(SessionCommandsTest, FailWhenTheOutputTakesNothing) {
+  FailingOutput full(0, ENOSPC);
+  std::ostream fullOut(&full);
+  EXPECT_EQ(runInto(fullOut, {"states"}), kFailed);
+  EXPECT_EQ(_err, "tallyctl: standard output: No space left on device\n");
+  EXPECT_EQ(runInto(fullOut, {"--version"}), kFailed);
+  EXPECT_EQ(_err, "tallyctl: standard output: does not take what is written\n");
+  FailingOutput version(0, ENOSPC);
+  std::ostream versionOut(&version);
+  EXPECT_EQ(runInto(versionOut, {"--version"}), kFailed);
+  EXPECT_EQ(_err, "tallyctl: standard output: No space left on device\n");
+  FailingOutput closed(0, EPIPE);
+  std::ostream closedOut(&closed);
+  EXPECT_EQ(runInto(closedOut, {"--help"}), kClosedPipe);
+  EXPECT_EQ(_err, "");
+}
+
 }  // namespace
 }  // namespace tallyd::tallyctl

@@ -3,13 +3,16 @@
 
 #include <gtest/gtest.h>
 
+#include <cerrno>
 #include <sstream>
+#include <streambuf>
 #include <string>
 #include <vector>
 
 #include "InputFile.h"
 #include "ProcFixtures.h"
 #include "ScriptedDaemon.h"
+#include "platform/JSON.h"
 #include "platform/Root.h"
 #include "tallyctl/Tool.h"
 
@@ -36,6 +39,28 @@ class FakePacer final : public Pacer {
   Hook _beforeReturn;
 };
 
+/// A file descriptor's stream that takes so many lines, then fails as the system call would.
+class FailingOutput final : public std::streambuf {
+ public:
+  FailingOutput(int lines, int error) : _linesLeft(lines), _error(error) {}
+  [[nodiscard]] const std::string& taken() const { return _taken; }
+
+ private:
+  int_type overflow(int_type character) override {
+    if (_linesLeft == 0) {
+      errno = _error;
+      return traits_type::eof();
+    }
+    _taken.push_back(traits_type::to_char_type(character));
+    if (_taken.back() == '\n') --_linesLeft;
+    return character;
+  }
+
+  int _linesLeft;
+  const int _error;
+  std::string _taken;
+};
+
 class ToolTest : public testing::Test {
  protected:
   using Method = ClientSessionMethod;
@@ -58,24 +83,42 @@ class ToolTest : public testing::Test {
 
   /// The exit status; what was written is in _out and _err.
   int run(std::vector<std::string> arguments, std::string_view standardInput = "") {
+    std::ostringstream out;
+    const int status = runInto(out, std::move(arguments), standardInput);
+    _out = out.str();
+    return status;
+  }
+
+  int runInto(std::ostream& out, std::vector<std::string> arguments, std::string_view standardInput = "") {
     arguments.insert(arguments.begin(), {"tallyctl", "--socket", _socket.string()});
     std::vector<const char*> pointers;
     for (const auto& argument : arguments) pointers.push_back(argument.c_str());
     const InputFile input(standardInput);
-    std::ostringstream out;
     std::ostringstream err;
     const Surroundings surroundings{
         .version = "1.2.3",
         .out = out,
         .err = err,
         .standardInput = input.descriptor(),
+        .progress = _progress,
         .procFolder = _proc,
         .makePacer = [this] { return std::make_unique<FakePacer>(_waits, _whileWaiting); },
     };
     const int status = runTool(static_cast<int>(pointers.size()), pointers.data(), surroundings);
-    _out = out.str();
     _err = err.str();
     return status;
+  }
+
+  /// The lines of _out, each read as an object.
+  [[nodiscard]] std::vector<Dictionary> objects() const {
+    std::vector<Dictionary> objects;
+    std::istringstream lines(_out);
+    for (std::string line; std::getline(lines, line);) {
+      const auto value = platform::valueFromJSON(line).value;
+      EXPECT_TRUE(value && value->dictionary()) << line;
+      objects.push_back(value && value->dictionary() ? *value->dictionary() : Dictionary());
+    }
+    return objects;
   }
 
   static Value message(int category, int type) { return Array{category, type}; }
@@ -94,6 +137,7 @@ class ToolTest : public testing::Test {
   std::filesystem::path _socket = tallydSocketPath(platform::Root(_folder.path()));
   ScriptedDaemon _daemon{_socket};
   int _waits = 0;
+  Console::Progress _progress = Console::Progress::Hidden;
   FakePacer::Hook _whileWaiting;
   std::string _out;
   std::string _err;

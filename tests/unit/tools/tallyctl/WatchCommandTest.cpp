@@ -60,6 +60,34 @@ TEST_F(WatchCommandTest, PrintsWhatItSentAsJSON) {
   EXPECT_EQ(_err, "session 7, states: https_post, dashboard\nsent 2 samples, 0 failed\n");
 }
 
+TEST_F(WatchCommandTest, EndsItsJSONWithWhatFailed) {
+  _waits = 1;
+  _daemon.script.rejects = [](auto) { return true; };
+  EXPECT_EQ(run({"--json", "watch"}), kFailed);
+  ASSERT_EQ(objects().size(), 2U);
+  EXPECT_EQ(objects()[0].integer("number"), 1);
+  EXPECT_EQ(objects()[1], (Dictionary{{"ok", false}, {"error", "sent 0 samples, 1 failed"}}));
+}
+
+TEST_F(WatchCommandTest, EndsInOrderAndQuietlyWhenNobodyReadsAnyMore) {
+  _waits = 1'000'000;
+  FailingOutput output(2, EPIPE);
+  std::ostream out(&output);
+  EXPECT_EQ(runInto(out, {"watch", "--session-id", "7"}), kClosedPipe);
+  EXPECT_EQ(_err, "");
+  EXPECT_EQ(std::count(output.taken().begin(), output.taken().end(), '\n'), 2);
+  EXPECT_EQ(samples().size(), 2U);
+  EXPECT_EQ(_daemon.calls().back().method, Method::FlushMessages);
+}
+
+TEST_F(WatchCommandTest, EndsAndSaysSoWhenItsOutputIsFull) {
+  _waits = 1'000'000;
+  FailingOutput output(1, ENOSPC);
+  std::ostream out(&output);
+  EXPECT_EQ(runInto(out, {"watch"}), kFailed);
+  EXPECT_EQ(_err, "tallyctl: standard output: No space left on device\n");
+}
+
 TEST_F(WatchCommandTest, EndsAfterTheAskedNumberOfSamples) {
   _waits = 100;
   EXPECT_EQ(run({"watch", "--count", "3"}), kSucceeded);
