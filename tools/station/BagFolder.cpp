@@ -6,8 +6,8 @@
 #include <stdexcept>
 
 #include "platform/property-list/PropertyList.h"
-#include "station/Files.h"
 #include "signing/StorebagSigning.h"
+#include "station/Files.h"
 
 namespace tallyd::station {
 
@@ -34,7 +34,7 @@ bool isPlainName(const std::string& name) {
 
 }  // namespace
 
-BagFolder::Answer BagFolder::storebag(const std::string& name) const {
+Answer BagFolder::storebag(const std::string& name) const {
   const std::filesystem::path file = _directory / (name + ".plist");
   if (!isPlainName(name) || !std::filesystem::exists(file)) {
     return {404, fmt::format("There is no storebag \"{}\" in {}\n", name, _directory.string())};

@@ -5,6 +5,7 @@
 #include <string>
 
 #include "signing/OpenSSLObjects.h"
+#include "station/Answer.h"
 
 namespace tallyd::station {
 
@@ -13,14 +14,10 @@ namespace tallyd::station {
 /// Threading: any thread.
 class BagFolder {
  public:
-  struct Answer {
-    int status;        ///< 200, 404 for a name without a file, 500 for a file that is no bag.
-    std::string body;  ///< The envelope, or what is wrong, with the file's name.
-  };
-
   /// Borrows the key. The folder need not be there yet.
   BagFolder(std::filesystem::path directory, EVP_PKEY* key) : _directory(std::move(directory)), _key(key) {}
 
+  /// 200 and the envelope; 404 for a name without a file, 500 for a file that is no bag, with its name.
   [[nodiscard]] Answer storebag(const std::string& name) const;
 
  private:

@@ -3,9 +3,10 @@
 #include <fmt/format.h>
 
 #include <exception>
+#include <utility>
 
 #include "platform/JSON.h"
-#include "station/Files.h"
+#include "station/ReadableText.h"
 
 namespace tallyd::station {
 
@@ -15,7 +16,19 @@ using platform::Value;
 
 namespace {
 
+constexpr int kOK = 200;
+constexpr int kBadRequest = 400;
+constexpr int kServerError = 500;
+
 PostResult problem(std::string text) { return {std::nullopt, std::move(text)}; }
+
+Journal::Item itemFor(const Post& post, const std::string& encoding, const Dictionary& event) {
+  const Dictionary record{{"clientId", post.clientId ? Value(*post.clientId) : Value()},
+                          {"postTime", post.postTime},
+                          {"encoding", encoding},
+                          {"event", event}};
+  return {readableEvent(event) + (post.clientId ? "" : "  [clientId missing]"), recordOf(record)};
+}
 
 }  // namespace
 
@@ -27,11 +40,12 @@ PostResult parsePost(std::string_view json) {
   const auto postTime = body->string("postTime");
   if (!postTime) return problem("\"postTime\" is missing or not a string");
   const auto clientId = body->string("clientId");
-  if (!clientId) return problem("\"clientId\" is missing or not a string");
+  if (!clientId && body->contains("clientId")) return problem("\"clientId\" is not a string");
   const Array* events = body->array("events");
   if (events == nullptr) return problem("\"events\" is missing or not an array");
 
-  Post post{std::string(*postTime), std::string(*clientId), {}};
+  Post post{std::string(*postTime), std::nullopt, {}};
+  if (clientId) post.clientId = *clientId;
   for (const Value& event : *events) {
     if (event.dictionary() == nullptr) return problem("an element of \"events\" is not an object");
     post.events.push_back(*event.dictionary());
@@ -39,44 +53,32 @@ PostResult parsePost(std::string_view json) {
   return {std::move(post), {}};
 }
 
-std::optional<std::string> EventCollector::collect(std::string_view json, const std::string& encoding) {
+Answer EventCollector::collect(std::string_view json, const std::string& encoding) {
   const PostResult result = parsePost(json);
-  if (!result.post) {
-    refuse(result.problem);
-    return result.problem;
+  if (!result.post) return refuse(kBadRequest, result.problem);
+  std::vector<Journal::Item> items;
+  for (const Dictionary& event : result.post->events) items.push_back(itemFor(*result.post, encoding, event));
+  try {
+    _journal.keep(std::move(items));
+  } catch (const std::exception& exception) {
+    return refuse(kServerError, fmt::format("can't keep events: {}", exception.what()));
   }
   const std::lock_guard lock(_mutex);
   ++_totals.posts;
   _totals.events += result.post->events.size();
-  keep(*result.post, encoding);
-  return std::nullopt;
+  return {kOK, ""};
 }
 
-void EventCollector::refuse(const std::string& problem) {
+Answer EventCollector::refuse(int status, const std::string& problem) {
+  _view.showProblem(fmt::format("refused a post: {}", problem));
   const std::lock_guard lock(_mutex);
   ++_totals.refused;
-  _view.showProblem(fmt::format("refused a post: {}", problem));
+  return {status, problem + "\n"};
 }
 
 EventCollector::Totals EventCollector::totals() const {
   const std::lock_guard lock(_mutex);
   return _totals;
-}
-
-void EventCollector::keep(const Post& post, const std::string& encoding) {
-  std::string lines;
-  for (const Dictionary& event : post.events) {
-    const Dictionary entry{
-        {"clientId", post.clientId}, {"postTime", post.postTime}, {"encoding", encoding}, {"event", event}};
-    const std::string record = platform::jsonFromValue(entry).value_or("{}");
-    _view.showEvent(event, record);
-    lines += record + "\n";
-  }
-  try {
-    appendToFile(_file, lines);
-  } catch (const std::exception& exception) {
-    _view.showProblem(fmt::format("can't keep events: {}", exception.what()));
-  }
 }
 
 }  // namespace tallyd::station

@@ -2,7 +2,6 @@
 #pragma once
 
 #include <cstdint>
-#include <filesystem>
 #include <mutex>
 #include <optional>
 #include <string>
@@ -10,6 +9,8 @@
 #include <vector>
 
 #include "platform/Value.h"
+#include "station/Answer.h"
+#include "station/Journal.h"
 #include "station/TerminalView.h"
 
 namespace tallyd::station {
@@ -17,7 +18,7 @@ namespace tallyd::station {
 /// One post's contents.
 struct Post {
   std::string postTime;
-  std::string clientId;
+  std::optional<std::string> clientId;  ///< Missing where the machine has no ID.
   std::vector<platform::Dictionary> events;
 };
 
@@ -26,14 +27,14 @@ struct PostResult {
   std::string problem;  ///< What is wrong; empty when there is a post.
 };
 
-/// Reads and checks the JSON text of a post: an object of "postTime" and "clientId", both strings, and
-/// "events", an array of objects.
+/// Reads and checks the JSON text of a post: an object of "postTime", a string, "clientId", a string or
+/// missing, and "events", an array of objects.
 [[nodiscard]] PostResult parsePost(std::string_view json);
 
-/// Every event is shown, and appended to a file as one line of JSON: {"clientId", "postTime", "encoding"
-/// ("gzip", or "identity" for a plain body), "event"}, the event as it came.
+/// Every event becomes one record: {"clientId" (null when the post has none), "postTime", "encoding" ("gzip",
+/// or "identity" for a plain body), "event"}, the event as it came.
 ///
-/// Threading: any thread; posts are taken one at a time.
+/// Threading: any thread.
 class EventCollector {
  public:
   struct Totals {
@@ -42,23 +43,21 @@ class EventCollector {
     std::uint64_t refused = 0;
   };
 
-  /// Borrows the view.
-  EventCollector(std::filesystem::path file, TerminalView& view) : _file(std::move(file)), _view(view) {}
+  /// Borrows the others.
+  EventCollector(Journal& journal, TerminalView& view) : _journal(journal), _view(view) {}
 
-  /// Takes a post's decoded body; what is wrong with it, or nothing. Problems with the file are shown, not
-  /// returned.
-  [[nodiscard]] std::optional<std::string> collect(std::string_view json, const std::string& encoding);
-  /// Counts a post that could not even be decoded, and shows why.
-  void refuse(const std::string& problem);
+  /// Takes a post's decoded body: 200, or 400 for what is no post, 500 when the events can't be kept; none of
+  /// them is then shown or counted.
+  [[nodiscard]] Answer collect(std::string_view json, const std::string& encoding);
+  /// Counts a post that was not taken, and shows why; the answer to it.
+  Answer refuse(int status, const std::string& problem);
 
   [[nodiscard]] Totals totals() const;
 
  private:
-  void keep(const Post& post, const std::string& encoding);
-
-  const std::filesystem::path _file;
+  Journal& _journal;
   TerminalView& _view;
-  mutable std::mutex _mutex;
+  mutable std::mutex _mutex;  ///< Guards the totals.
   Totals _totals;
 };
 

@@ -21,6 +21,21 @@ using platform::FileDescriptor;
   throw std::system_error(errno, std::generic_category(), path.string());
 }
 
+std::system_error notRegular(const std::filesystem::path& path) {
+  return {EINVAL, std::generic_category(), path.string() + " is not a regular file"};
+}
+
+/// Opens without waiting and refuses whatever is no regular file.
+FileDescriptor openRegular(const std::filesystem::path& path, int flags) {
+  FileDescriptor file(::open(path.c_str(), flags | O_NONBLOCK | O_CLOEXEC, 0644));
+  struct stat status {};
+  // A pipe that nobody reads can't even be opened for writing.
+  if (!file && errno == ENXIO) throw notRegular(path);
+  if (!file || ::fstat(file.get(), &status) != 0) fail(path);
+  if (!S_ISREG(status.st_mode)) throw notRegular(path);
+  return file;
+}
+
 void writeAll(int descriptor, std::string_view bytes, const std::filesystem::path& path) {
   while (!bytes.empty()) {
     const ssize_t count = ::write(descriptor, bytes.data(), bytes.size());
@@ -33,8 +48,7 @@ void writeAll(int descriptor, std::string_view bytes, const std::filesystem::pat
 }  // namespace
 
 std::string readFile(const std::filesystem::path& path) {
-  const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  if (!file) fail(path);
+  const FileDescriptor file = openRegular(path, O_RDONLY);
   std::string bytes;
   std::array<char, 16384> buffer;
   while (true) {
@@ -61,9 +75,15 @@ void replaceFile(const std::filesystem::path& path, std::string_view bytes, mode
 }
 
 void appendToFile(const std::filesystem::path& path, std::string_view bytes) {
-  const FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644));
-  if (!file) fail(path);
-  writeAll(file.get(), bytes, path);
+  const FileDescriptor file = openRegular(path, O_WRONLY | O_CREAT | O_APPEND);
+  const off_t end = ::lseek(file.get(), 0, SEEK_END);
+  try {
+    writeAll(file.get(), bytes, path);
+  } catch (...) {
+    // A part of a line would spoil the next one. When even this fails, nothing more can be done.
+    [[maybe_unused]] const int ignored = ::ftruncate(file.get(), end);
+    throw;
+  }
 }
 
 }  // namespace tallyd::station

@@ -7,8 +7,8 @@
 #include <stdexcept>
 
 #include "signing/CertificateAuthority.h"
-#include "station/Files.h"
 #include "signing/StorebagSigning.h"
+#include "station/Files.h"
 
 namespace tallyd::station {
 
@@ -40,7 +40,8 @@ StationIdentity::StationIdentity(const std::filesystem::path& directory)
 
 void StationIdentity::prepareStorebagKey(const std::filesystem::path& directory) {
   const std::filesystem::path file = directory / "storebag-key.pem";
-  if (!std::filesystem::exists(file)) replaceFile(file, signing::privateKeyPEM(signing::makeStorebagKey().get()), kPrivate);
+  if (!std::filesystem::exists(file))
+    replaceFile(file, signing::privateKeyPEM(signing::makeStorebagKey().get()), kPrivate);
   _storebagKey = readStorebagKey(file);
 
   const std::filesystem::path publicFile = directory / "publicKey.der";
@@ -53,7 +54,11 @@ void StationIdentity::prepareCertificate(const std::filesystem::path& directory)
   const std::filesystem::path authorityFile = directory / "ca.pem";
   const std::array<std::filesystem::path, 3> files{authorityFile, _certificateFile, _certificateKeyFile};
   const auto exists = [](const std::filesystem::path& file) { return std::filesystem::exists(file); };
-  if (std::all_of(files.begin(), files.end(), exists)) return;
+  if (std::all_of(files.begin(), files.end(), exists)) {
+    // The TLS library opens them by name and would wait for a pipe.
+    for (const auto& file : files) (void)readFile(file);
+    return;
+  }
   if (const auto present = std::find_if(files.begin(), files.end(), exists); present != files.end()) {
     const auto missing = std::find_if_not(files.begin(), files.end(), exists);
     throw std::runtime_error(fmt::format("{} is missing; remove {} and its like too, to have new ones made",

@@ -1,23 +1,20 @@
 // The station's HTTP servers.
 #pragma once
 
-#include <chrono>
-#include <cstdint>
 #include <filesystem>
+#include <functional>
 #include <memory>
 #include <optional>
+#include <vector>
 
-#include "station/BagFolder.h"
-#include "station/EventCollector.h"
-#include "station/TerminalView.h"
+namespace httplib {
+class Server;
+}
 
 namespace tallyd::station {
 
-/// Serves storebags and collects events over HTTPS on 127.0.0.1; on request, collects events over plain HTTP
-/// too.
-///
-///  - GET /storebags/sorrel/NAME and /bags/sorrel/NAME: the storebag NAME.
-///  - POST /events and below: a post, plain or with Content-Encoding gzip; 400 for what can't be read.
+/// Answers over HTTPS on 127.0.0.1 and, on request, over plain HTTP too; what it answers are the groups of
+/// routes that it is given.
 ///
 /// Listens from construction to destruction, which waits for requests under way and up to a second for idle
 /// connections.
@@ -28,19 +25,26 @@ class StationServer {
     std::filesystem::path certificateKeyFile;
     int httpsPort = 0;            ///< 0 lets the system choose.
     std::optional<int> httpPort;  ///< Nothing: no plain HTTP.
-    std::chrono::seconds maxAge{0};
   };
 
-  /// Borrows the others. Throws std::runtime_error with the file or address at fault.
-  StationServer(const Settings& settings, const BagFolder& bags, EventCollector& collector,
-                TerminalView& view);
+  /// Some requests and who answers them.
+  struct RouteGroup {
+    enum class Reach { HTTPSOnly, HTTPSAndHTTP };
+    Reach reach;
+    /// Declares the group's handlers; called once for each server, before it listens. The handlers are called
+    /// on any thread; what they throw is answered with 500.
+    std::function<void(httplib::Server&)> addTo;
+  };
+
+  /// What the handlers use must outlive this object. Throws std::runtime_error with the file or address at
+  /// fault.
+  StationServer(const Settings& settings, const std::vector<RouteGroup>& groups);
   ~StationServer();
   StationServer(const StationServer&) = delete;
   StationServer& operator=(const StationServer&) = delete;
 
   [[nodiscard]] int httpsPort() const;
   [[nodiscard]] std::optional<int> httpPort() const;
-  [[nodiscard]] std::uint64_t servedStorebags() const;
 
  private:
   class Implementation;

@@ -3,35 +3,31 @@
 
 #include <mutex>
 #include <ostream>
-#include <string>
 #include <string_view>
-
-#include "platform/Value.h"
 
 namespace tallyd::station {
 
-/// One event as a line of text: time (UTC), sender, session, method, status, number, then the payload's
-/// fields. Whatever is not plain is quoted and escaped, so that no event can play tricks on the terminal.
-[[nodiscard]] std::string readableEvent(const platform::Dictionary& event);
-
-/// Lines of events and notices to one stream, of problems to another; control characters become question
-/// marks.
+/// Lines of what was taken in and of notices to one stream, of problems to another; control characters become
+/// question marks.
 ///
 /// Threading: any thread; lines stay whole.
 class TerminalView {
  public:
-  enum class Events {
+  enum class Records {
     Readable,
-    JSON,  ///< The stream then carries nothing but events; notices go with the problems.
+    JSON,  ///< The stream then carries nothing but records; notices go with the problems.
     Hidden
   };
 
   /// Borrows the streams.
-  TerminalView(std::ostream& output, std::ostream& problems, Events events)
-      : _output(output), _problems(problems), _events(events) {}
+  TerminalView(std::ostream& output, std::ostream& problems, Records records)
+      : _output(output), _problems(problems), _records(records) {}
 
-  /// @param record  The event as it is kept: a JSON object in one line, without the line feed.
-  void showEvent(const platform::Dictionary& event, std::string_view record);
+  /// @param readable  One line or more, for people.
+  /// @param record    The same as it is kept: a JSON object in one line, without the line feed.
+  void showRecord(std::string_view readable, std::string_view record);
+  /// A line for people only.
+  void showAside(std::string_view line);
   void showNotice(std::string_view line);
   void showProblem(std::string_view line);
 
@@ -40,7 +36,7 @@ class TerminalView {
 
   std::ostream& _output;
   std::ostream& _problems;
-  const Events _events;
+  const Records _records;
   std::mutex _mutex;
 };
 

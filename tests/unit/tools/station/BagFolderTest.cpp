@@ -2,12 +2,13 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 #include "fakes/TemporaryFolder.h"
 #include "platform/Base64.h"
 #include "platform/property-list/PropertyList.h"
-#include "station/Files.h"
 #include "signing/StorebagSigning.h"
+#include "station/Files.h"
 
 namespace tallyd::station {
 
@@ -22,7 +23,7 @@ class BagFolderTest : public testing::Test {
     replaceFile(folder.path() / (name + ".plist"), text, 0644);
   }
   /// The "version" inside an envelope.
-  static std::string versionIn(const BagFolder::Answer& answer) {
+  static std::string versionIn(const Answer& answer) {
     const auto envelope = platform::propertyListWithData(answer.body).value;
     if (!envelope || envelope->dictionary() == nullptr) return "no envelope";
     const auto bytes =
@@ -67,10 +68,17 @@ TEST_F(BagFolderTest, KnowsOnlyNamesOfFilesInTheFolder) {
 TEST_F(BagFolderTest, NamesTheFileThatIsNoBag) {
   for (const char* text : {"{ version = ", "( a, b )", "{ release = { }; }", "{ version = ( 1 ); }", ""}) {
     writeBag("broken", text);
-    const BagFolder::Answer answer = bags.storebag("broken");
+    const Answer answer = bags.storebag("broken");
     EXPECT_EQ(answer.status, 500) << text;
     EXPECT_THAT(answer.body, HasSubstr((folder.path() / "broken.plist").string())) << text;
   }
+}
+
+TEST_F(BagFolderTest, DoesNotWaitForAPipeInPlaceOfABag) {
+  ASSERT_EQ(::mkfifo((folder.path() / "pipe.plist").c_str(), 0600), 0);
+  const Answer answer = bags.storebag("pipe");
+  EXPECT_EQ(answer.status, 500);
+  EXPECT_THAT(answer.body, HasSubstr((folder.path() / "pipe.plist").string() + " is not a regular file"));
 }
 
 }  // namespace tallyd::station

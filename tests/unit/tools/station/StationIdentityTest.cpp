@@ -9,8 +9,8 @@
 #include <map>
 
 #include "fakes/TemporaryFolder.h"
-#include "station/Files.h"
 #include "signing/StorebagSigning.h"
+#include "station/Files.h"
 
 namespace tallyd::station {
 
@@ -81,9 +81,9 @@ TEST_F(StationIdentityTest, CertifiesTheLoopbackNamesUnderItsAuthority) {
   EXPECT_EQ(X509_check_ip_asc(server.get(), "127.0.0.1", 0), 1);
   EXPECT_EQ(X509_check_ip_asc(server.get(), "::1", 0), 1);
   EXPECT_NE(X509_check_host(server.get(), "storebags.quillon.example", 0, 0, nullptr), 1);
-  EXPECT_EQ(
-      X509_check_private_key(server.get(), signing::privateKeyFromPEM(readFile(identity.certificateKeyFile())).get()),
-      1);
+  EXPECT_EQ(X509_check_private_key(server.get(),
+                                   signing::privateKeyFromPEM(readFile(identity.certificateKeyFile())).get()),
+            1);
 }
 
 TEST_F(StationIdentityTest, WritesTheMissingPublicKeyAgain) {
@@ -107,6 +107,17 @@ TEST_F(StationIdentityTest, RefusesAStorebagKeyThatIsNotRSA) {
   std::filesystem::copy_file(directory / "station-key.pem", directory / "storebag-key.pem",
                              std::filesystem::copy_options::overwrite_existing);
   EXPECT_THAT(errorOfOpening(directory), HasSubstr("not an RSA key"));
+}
+
+TEST_F(StationIdentityTest, DoesNotWaitForAPipe) {
+  { const StationIdentity identity(directory); }
+  for (const char* name : {"station.pem", "station-key.pem", "storebag-key.pem", "publicKey.der"}) {
+    std::filesystem::rename(directory / name, folder.path() / "kept");
+    ASSERT_EQ(::mkfifo((directory / name).c_str(), 0600), 0);
+    EXPECT_THAT(errorOfOpening(directory), HasSubstr((directory / name).string() + " is not a regular file"));
+    std::filesystem::rename(folder.path() / "kept", directory / name);
+  }
+  EXPECT_EQ(errorOfOpening(directory), "no error");
 }
 
 }  // namespace tallyd::station

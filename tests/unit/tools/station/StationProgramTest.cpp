@@ -2,7 +2,7 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <zlib.h>
+#include <sys/stat.h>
 #include <csignal>
 
 #include <condition_variable>
@@ -13,10 +13,12 @@
 #include "fakes/TemporaryFolder.h"
 #include "platform/JSON.h"
 #include "platform/http/CurlHTTPClient.h"
+#include "platform/property-list/KeyedArchive.h"
 #include "platform/property-list/PropertyList.h"
 #include "station/Files.h"
 #include "support/ChildProcess.h"
 #include "support/RawServer.h"
+#include "unit/tools/station/Gzipped.h"
 
 namespace tallyd::station {
 
@@ -33,21 +35,6 @@ constexpr const char* kProgram = TALLYD_BIN_DIR "/tally-station";
 constexpr const char* kPost =
     R"({"postTime":"100.  5","clientId":"C","events":[{"_sender":"PH","_sessionID":"42","_method":"7","_status":"2",)"
     R"("_eventNumber":"3","eventTime":"1772366401.250","note":"hello"}]})";
-
-std::string gzipped(const std::string& text) {
-  constexpr int kGzip = 15 + 16;  // zlib.h: the largest window, with a gzip header.
-  z_stream stream{};
-  deflateInit2(&stream, Z_DEFAULT_COMPRESSION, Z_DEFLATED, kGzip, 8, Z_DEFAULT_STRATEGY);
-  std::string bytes(deflateBound(&stream, text.size()), '\0');
-  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(text.data()));
-  stream.avail_in = static_cast<uInt>(text.size());
-  stream.next_out = reinterpret_cast<Bytef*>(bytes.data());
-  stream.avail_out = static_cast<uInt>(bytes.size());
-  deflate(&stream, Z_FINISH);
-  bytes.resize(stream.total_out);
-  deflateEnd(&stream);
-  return bytes;
-}
 
 HTTPRequest get(const std::string& url) {
   HTTPRequest request;
@@ -157,13 +144,97 @@ TEST_F(StationProgramTest, RefusesBrokenPosts) {
   startStation();
   EXPECT_EQ(statusOf(send(post(https + "/events", "junk"))), 400);
   EXPECT_EQ(statusOf(send(post(https + "/events", "not gzip", "gzip"))), 400);
-  const std::string truncated = gzipped(kPost).substr(0, 60);
-  EXPECT_EQ(statusOf(send(post(https + "/events", truncated, "gzip"))), 400);
+  const std::string whole = gzipped(kPost);
+  EXPECT_EQ(statusOf(send(post(https + "/events", whole.substr(0, 60), "gzip"))), 400);
+  EXPECT_EQ(statusOf(send(post(https + "/events", whole.substr(0, whole.size() - 1), "gzip"))), 400);
+  EXPECT_EQ(statusOf(send(post(https + "/events", whole.substr(0, whole.size() - 8), "gzip"))), 400);
+  EXPECT_EQ(statusOf(send(post(https + "/events", kPost, "br"))), 415);
   EXPECT_EQ(statusOf(send(post(https + "/events", kPost))), 200);
   station->sendSignal(SIGINT);
   EXPECT_EQ(station->waitForExit(), 0);
-  EXPECT_THAT(station->text(Stream::Output), HasSubstr("1 events in 1 posts, 3 posts refused"));
+  EXPECT_THAT(station->text(Stream::Output), HasSubstr("1 events in 1 posts, 6 posts refused"));
   EXPECT_THAT(station->text(Stream::Errors), HasSubstr("the body can't be decoded (gzip)"));
+}
+
+TEST_F(StationProgramTest, SaysThatItCannotKeepEvents) {
+  startStation();
+  ASSERT_EQ(::mkfifo((directory / "events.jsonl").c_str(), 0600), 0);
+  const HTTPResult result = send(post(https + "/events", kPost));
+  EXPECT_EQ(statusOf(result), 500);
+  EXPECT_THAT(std::string(result.data.bytes()), HasSubstr((directory / "events.jsonl").string()));
+  std::filesystem::remove(directory / "events.jsonl");
+  EXPECT_EQ(statusOf(send(post(https + "/events", kPost))), 200);
+}
+
+TEST_F(StationProgramTest, KeepsUploads) {
+  startStation();
+  const std::string query =
+      "?uuid=0123&sequence=42&description=Parlor%20QPRC%20log%20(Uploaded%20by%20PHS)"
+      "&filename=..%2F..%2Fa%20b%2Blog.gz&raw=true";
+  const HTTPResult result = send(post(https + "/upload" + query, gzipped("contents"), "gzip"));
+  EXPECT_EQ(statusOf(result), 200);
+  EXPECT_THAT(std::string(result.data.bytes()), HasSubstr("success"));
+  EXPECT_EQ(statusOf(send(post(http + "/upload", "plain"))), 200);
+  EXPECT_EQ(statusOf(send(post(http + "/upload", ""))), 200);
+  EXPECT_EQ(statusOf(send(post(http + "/upload", "no gzip", "gzip"))), 400);
+
+  const auto kept = platform::valueFromJSON(
+      readFile(directory / "uploads.jsonl").substr(0, readFile(directory / "uploads.jsonl").find('\n')));
+  ASSERT_TRUE(kept.value && kept.value->dictionary());
+  EXPECT_EQ(kept.value->dictionary()->string("filename"), "../../a b+log.gz");
+  const std::string file(kept.value->dictionary()->string("file").value_or(""));
+  EXPECT_TRUE(file.ends_with("-a_b+log")) << file;
+  EXPECT_EQ(readFile(directory / file), "contents");
+  const std::filesystem::directory_iterator files(directory / "uploads");
+  EXPECT_EQ(std::distance(begin(files), end(files)), 3);
+}
+
+TEST_F(StationProgramTest, AnswersUploadsAsItIsTold) {
+  startStation({"--upload-answer", "busy"});
+  EXPECT_EQ(std::string(send(post(https + "/upload", "plain")).data.bytes()), "busy");
+}
+
+TEST_F(StationProgramTest, TellsWhereLogDataIs) {
+  startStation();
+  const std::string archive = platform::archivedDataWithRootObject(platform::Array{"line"}).value();
+  for (const int line : {1, 2}) {
+    const HTTPResult result = send(post(https + "/log-data", archive));
+    EXPECT_EQ(statusOf(result), 200);
+    EXPECT_EQ(std::string(result.data.bytes()),
+              (directory / "logdata.jsonl").string() + ":" + std::to_string(line));
+  }
+  EXPECT_EQ(statusOf(send(post(http + "/log-data", gzipped(archive), "gzip"))), 200);
+  EXPECT_EQ(statusOf(send(post(http + "/log-data", "junk"))), 400);
+  EXPECT_TRUE(station->waitForText(Stream::Output, "\n  [0] \"line\"\n"));
+}
+
+TEST_F(StationProgramTest, EndsWhileAPipeStandsForABag) {
+  startStation();
+  ASSERT_EQ(::mkfifo((directory / "bags/playhall.plist").c_str(), 0600), 0);
+  EXPECT_EQ(statusOf(send(get(https + "/bags/sorrel/playhall?version=6.21"))), 500);
+  station->sendSignal(SIGTERM);
+  EXPECT_EQ(station->waitForExit(), 0);
+}
+
+TEST_F(StationProgramTest, IsAloneInItsDirectory) {
+  startStation();
+  ChildProcess second(kProgram, {"--directory", directory.string(), "--port", "0"});
+  EXPECT_EQ(second.waitForExit(), 1);
+  EXPECT_THAT(second.text(Stream::Errors), HasSubstr((directory / "station.lock").string()));
+  EXPECT_THAT(second.text(Stream::Errors), HasSubstr("process " + std::to_string(station->pid())));
+  EXPECT_TRUE(std::filesystem::exists(directory / "station.json"));
+  station->sendSignal(SIGKILL);
+  EXPECT_EQ(station->waitForExit(), -SIGKILL);
+  startStation();
+}
+
+TEST_F(StationProgramTest, ShowsTotalsWhenAsked) {
+  startStation({"--datagram-port", "0", "--lose", "10", "--seed", "7"});
+  EXPECT_TRUE(station->waitForText(Stream::Output, "--seed 7 plays it again\n"));
+  station->sendSignal(SIGUSR1);
+  EXPECT_TRUE(station->waitForText(Stream::Output, "\ndatagrams: 0 received"));
+  const auto ready = platform::valueFromJSON(readFile(directory / "station.json"));
+  EXPECT_GT(ready.value->dictionary()->integer("datagram_port"), 0);
 }
 
 TEST_F(StationProgramTest, ShowsOneJSONObjectForEachEvent) {
@@ -203,6 +274,16 @@ TEST_F(StationProgramTest, SaysWhatItCannotDo) {
   EXPECT_THAT(nothing.text(Stream::Errors), HasSubstr("--directory"));
   ChildProcess wrong(kProgram, {"--directory", directory.string(), "--port", "70000"});
   EXPECT_EQ(wrong.waitForExit(), 2);
+  for (const char* option : {"--lose", "--lose-acks", "--duplicate", "--reorder"}) {
+    ChildProcess excess(kProgram,
+                        {"--directory", directory.string(), "--datagram-port", "0", option, "100.5"});
+    EXPECT_EQ(excess.waitForExit(), 2);
+    EXPECT_THAT(excess.text(Stream::Errors),
+                HasSubstr(std::string(option) + ": 100.5 is not a percentage from 0 to 100"));
+  }
+  ChildProcess useless(kProgram, {"--directory", directory.string(), "--lose", "5"});
+  EXPECT_EQ(useless.waitForExit(), 2);
+  EXPECT_THAT(useless.text(Stream::Errors), HasSubstr("--lose requires --datagram-port"));
 
   const auto taken = test::listenOnLoopback();
   const std::string port = std::to_string(test::portOf(taken.get()));
