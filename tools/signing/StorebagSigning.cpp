@@ -15,8 +15,6 @@ using platform::Value;
 
 namespace {
 
-constexpr unsigned kKeyBits = 2048;
-
 std::string written(const Value& value, PropertyListFormat format) {
   auto bytes = platform::dataWithPropertyList(value, format);
   if (!bytes) throw std::runtime_error("the bag can't be written as a property list");
@@ -25,10 +23,16 @@ std::string written(const Value& value, PropertyListFormat format) {
 
 }  // namespace
 
-OpenSSLPointer<EVP_PKEY> makeStorebagKey() {
-  OpenSSLPointer<EVP_PKEY> key(EVP_RSA_gen(kKeyBits));
+OpenSSLPointer<EVP_PKEY> makeStorebagKey(unsigned bits) {
+  OpenSSLPointer<EVP_PKEY> key(EVP_RSA_gen(bits));
   requireOpenSSL(key != nullptr, "making an RSA key");
   return key;
+}
+
+void requireStorebagKey(EVP_PKEY* key) {
+  if (EVP_PKEY_get_base_id(key) != EVP_PKEY_RSA) throw std::runtime_error("is no RSA key");
+  if (EVP_PKEY_get_bits(key) < static_cast<int>(kStorebagKeyBits))
+    throw std::runtime_error("is shorter than 2048 bits");
 }
 
 std::string publicKeyDER(EVP_PKEY* key) {

@@ -10,8 +10,13 @@
 
 namespace tallyd::signing {
 
-/// A new RSA key of 2048 bits; throws.
-[[nodiscard]] OpenSSLPointer<EVP_PKEY> makeStorebagKey();
+inline constexpr unsigned kStorebagKeyBits = 2048;  ///< The shortest that bags should be signed with.
+
+/// A new RSA key; throws.
+[[nodiscard]] OpenSSLPointer<EVP_PKEY> makeStorebagKey(unsigned bits = kStorebagKeyBits);
+
+/// Throws std::runtime_error unless bags may be signed with the key: RSA, of kStorebagKeyBits or more.
+void requireStorebagKey(EVP_PKEY* key);
 
 /// The public half as a SubjectPublicKeyInfo (RFC 5280, section 4.1.2.7), the form of the resource
 /// "publicKey.der"; throws.
