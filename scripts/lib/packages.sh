@@ -13,10 +13,12 @@ BUILD_PACKAGES=(
 # shellcheck disable=SC2034  # As above.
 RUN_PACKAGES=(systemd ca-certificates tzdata)
 
-# Programs and data that the tests run: a web server, D-Bus clients, certificates, time zones.
+# Programs and data that the tests run: a web server, a browser with a font, D-Bus clients, what looks at libraries and makes
+# packages, certificates, time zones.
 # shellcheck disable=SC2034  # As above.
 TEST_PACKAGES=(
-  nginx-light libglib2.0-bin systemd python3 openssl curl procps ca-certificates tzdata
+  nginx-light chromium-headless-shell fonts-dejavu-core libglib2.0-bin systemd python3 python3-dbus binutils dpkg-dev fakeroot
+  file bash-completion shellcheck groff-base man-db openssl curl procps ca-certificates tzdata
 )
 
 die() {
