@@ -52,8 +52,9 @@ EventFacts factsOf(std::size_t number) {
 std::string jsonOfEvents(const std::vector<Dictionary>& payloads, platform::Log& log) {
   std::vector<Dictionary> events;
   events.reserve(payloads.size());
+  EventRecords records;
   for (std::size_t number = 0; number < payloads.size(); ++number) {
-    events.push_back(eventRecord(payloads[number], factsOf(number)));
+    events.push_back(records.record(payloads[number], factsOf(number)));
   }
   for (Dictionary& event : events) sanitizeEventForJSON(event, log);
   return *postBody({1'760'000'200, 125'000}, "6f1cbb53-52a8-5f0c-9d0a-0d1a4c6b7e21", std::move(events));

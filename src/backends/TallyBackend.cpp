@@ -1,6 +1,7 @@
 #include "backends/TallyBackend.h"
 
 #include <fmt/format.h>
+#include <openssl/evp.h>
 #include <openssl/sha.h>
 
 #include <algorithm>
@@ -12,6 +13,31 @@
 
 namespace tallyd {
 
+namespace {
+
+using Digest = std::array<unsigned char, SHA256_DIGEST_LENGTH>;
+
+/// OpenSSL's functions for one text look the algorithm up by its name each time, which costs more than the
+/// digest of a short one.
+Digest sha256(std::string_view text) {
+  struct Kept {
+    EVP_MD* algorithm = EVP_MD_fetch(nullptr, "SHA256", nullptr);
+    EVP_MD_CTX* context = EVP_MD_CTX_new();
+    ~Kept() {
+      EVP_MD_CTX_free(context);
+      EVP_MD_free(algorithm);
+    }
+  };
+  thread_local const Kept kept;
+  Digest digest{};
+  EVP_DigestInit_ex2(kept.context, kept.algorithm, nullptr);
+  EVP_DigestUpdate(kept.context, text.data(), text.size());
+  EVP_DigestFinal_ex(kept.context, digest.data(), nullptr);
+  return digest;
+}
+
+}  // namespace
+
 TallyBackend::TallyBackend(const platform::Platform& platform, std::string_view name, Payload profile,
                            std::optional<std::string> productFamily)
     : _platform(platform),
@@ -22,8 +48,7 @@ TallyBackend::TallyBackend(const platform::Platform& platform, std::string_view 
 
 std::string TallyBackend::convertIntoSHA256(std::string_view text) {
   const std::size_t hashedBytes = std::min(platform::utf16Length(text), text.size());
-  std::array<unsigned char, SHA256_DIGEST_LENGTH> digest{};
-  SHA256(reinterpret_cast<const unsigned char*>(text.data()), hashedBytes, digest.data());
+  const auto digest = sha256(text.substr(0, hashedBytes));
   std::string hexadecimal;
   hexadecimal.reserve(2 * digest.size());
   constexpr std::string_view kDigits = "0123456789abcdef";

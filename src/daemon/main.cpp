@@ -13,7 +13,7 @@
 #include "framework/ClientSessionInterface.h"
 #include "framework/InspectionInterface.h"
 #include "framework/TallyLogging.h"
-#include "platform/ipc/SdBusListener.h"
+#include "platform/ipc/DBusListener.h"
 #include "platform/sandbox/LinuxSandbox.h"
 #include "platform/system/SystemClock.h"
 
@@ -49,10 +49,10 @@ void reportFailedStart(tallyd::platform::Log& log, const tallyd::DaemonOptions& 
 
 /// The inspection service's own socket; null, after a warning, where it can't be had: the daemon does its
 /// work without it.
-std::unique_ptr<tallyd::platform::SdBusListener> makeInspectionListener(
+std::unique_ptr<tallyd::platform::DBusListener> makeInspectionListener(
     const tallyd::platform::Root& root, const tallyd::platform::Platform& platform) {
   try {
-    return std::make_unique<tallyd::platform::SdBusListener>(tallyd::inspectionSocketPath(root),
+    return std::make_unique<tallyd::platform::DBusListener>(tallyd::inspectionSocketPath(root),
                                                              platform.queues, platform.log,
                                                              tallyd::platform::SocketAccess::OwnersOnly);
   } catch (const std::exception& error) {
@@ -72,7 +72,7 @@ int serve(const tallyd::DaemonOptions& options, const tallyd::platform::Root& ro
   }
   const tallyd::ProductionPlatform production(root, log, clock, sandbox);
   const tallyd::platform::Platform& platform = production.platform();
-  tallyd::platform::SdBusListener listener(tallyd::tallydSocketPath(root), platform.queues, log);
+  tallyd::platform::DBusListener listener(tallyd::tallydSocketPath(root), platform.queues, log);
   const auto tap = std::make_shared<tallyd::Tap>(platform.queues, clock);
   const auto ledger = std::make_shared<tallyd::Ledger>(tap);
   tallyd::TallydAgent agent(platform, ledger);

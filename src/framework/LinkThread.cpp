@@ -4,7 +4,7 @@
 #include <random>
 #include <utility>
 
-#include "framework/SdBusServiceChannel.h"
+#include "framework/SocketServiceChannel.h"
 #include "platform/queues/AsioQueues.h"
 
 namespace tallyd {

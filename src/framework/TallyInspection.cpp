@@ -4,12 +4,12 @@
 #include <utility>
 
 #include "framework/InspectionInterface.h"
-#include "platform/ipc/SdBusClientConnection.h"
+#include "platform/ipc/DBusClientConnection.h"
 #include "platform/queues/AsioQueues.h"
 
 namespace tallyd {
 
-using platform::SdBusClientConnection;
+using platform::DBusClientConnection;
 using platform::Value;
 
 namespace {
@@ -24,19 +24,19 @@ constexpr std::chrono::milliseconds kGrace{
 class TallyInspection::Channel {
  public:
   Channel(const std::filesystem::path& socketPath, std::chrono::milliseconds timeout)
-      : connection(SdBusClientConnection::connect(socketPath, inspectionInterface(), _queues)),
+      : connection(DBusClientConnection::connect(socketPath, inspectionInterface(), _queues)),
         _timeout(timeout) {}
   ~Channel() { connection->close(kPatienceAtTheEnd); }
   Channel(const Channel&) = delete;
   Channel& operator=(const Channel&) = delete;
 
-  SdBusClientConnection::Reply wait(InspectionMethod method,
+  DBusClientConnection::Reply wait(InspectionMethod method,
                                     std::vector<platform::FileDescriptor> descriptors = {}) const {
-    const auto promise = std::make_shared<std::promise<SdBusClientConnection::Reply>>();
+    const auto promise = std::make_shared<std::promise<DBusClientConnection::Reply>>();
     auto answer = promise->get_future();
     const std::vector<Value> placeholders(descriptors.size());
     connection->call({static_cast<std::size_t>(method), placeholders, std::move(descriptors)}, _timeout,
-                     [promise](SdBusClientConnection::Reply reply) { promise->set_value(std::move(reply)); });
+                     [promise](DBusClientConnection::Reply reply) { promise->set_value(std::move(reply)); });
     if (answer.wait_for(_timeout + kGrace) != std::future_status::ready)
       return {"the service does not answer", {}};
     return answer.get();
@@ -46,7 +46,7 @@ class TallyInspection::Channel {
   platform::AsioQueues _queues{1};
 
  public:
-  const std::shared_ptr<SdBusClientConnection> connection;
+  const std::shared_ptr<DBusClientConnection> connection;
 
  private:
   const std::chrono::milliseconds _timeout;

@@ -34,11 +34,15 @@ class Shared {
   const T& operator*() const noexcept { return _box->value; }
   const T* operator->() const noexcept { return &_box->value; }
 
+  /// Others refer to the object too.
+  [[nodiscard]] bool isShared() const noexcept {
+    return _box && _box->count.load(std::memory_order_acquire) > 1;
+  }
   /// The object for changing: made when there is none, copied when others refer to it too.
   T& unique() {
     if (!_box) {
       *this = Shared(T());
-    } else if (_box->count.load(std::memory_order_acquire) > 1) {
+    } else if (isShared()) {
       *this = Shared(_box->value);
     }
     return _box->value;

@@ -132,9 +132,23 @@ namespace {
 
 constexpr auto kByKey = [](const Dictionary::Entry& entry, std::string_view key) { return entry.key < key; };
 
+constexpr auto kInOrder = [](const Dictionary::Entry& a, const Dictionary::Entry& b) {
+  return a.key < b.key;
+};
+
+/// Small ones are sorted where they lie: the library's stable sort asks for memory.
+void sortByKey(std::vector<Dictionary::Entry>& entries) {
+  constexpr std::size_t kSmall = 32;
+  if (entries.size() > kSmall) return std::stable_sort(entries.begin(), entries.end(), kInOrder);
+  for (auto next = entries.begin(); next != entries.end(); ++next) {
+    std::rotate(std::upper_bound(entries.begin(), next, *next, kInOrder), next, std::next(next));
+  }
+}
+
 std::vector<Dictionary::Entry> sortedEntries(std::vector<Dictionary::Entry> entries) {
-  std::stable_sort(entries.begin(), entries.end(),
-                   [](const auto& a, const auto& b) { return a.key < b.key; });
+  const auto isOutOfOrder = [](const auto& a, const auto& b) { return a.key >= b.key; };
+  if (std::adjacent_find(entries.begin(), entries.end(), isOutOfOrder) == entries.end()) return entries;
+  sortByKey(entries);
   // Of equal keys the last given stays: walking backwards, it is the first met.
   const auto kept = std::unique(entries.rbegin(), entries.rend(),
                                 [](const auto& a, const auto& b) { return a.key == b.key; });
@@ -197,22 +211,44 @@ void Dictionary::remove(std::string_view key) {
   all.erase(std::lower_bound(all.begin(), all.end(), key, kByKey));
 }
 
+namespace {
+
+/// `mine` with the entries from `theirs` on set over it; both in the order of their keys.
+template <class Theirs>
+std::vector<Dictionary::Entry> mergedEntries(const Dictionary& mine, Theirs theirs, Theirs end) {
+  std::vector<Dictionary::Entry> merged;
+  merged.reserve(mine.size() + static_cast<std::size_t>(end - theirs));
+  const Dictionary::Entry* next = mine.begin();
+  for (; theirs != end; ++theirs) {
+    const std::string& key = (*theirs).key;
+    while (next != mine.end() && next->key < key) merged.push_back(*next++);
+    if (next != mine.end() && next->key == key) ++next;
+    merged.push_back(*theirs);
+  }
+  merged.insert(merged.end(), next, mine.end());
+  return merged;
+}
+
+}  // namespace
+
 void Dictionary::merge(const Dictionary& other) {
+  if (!other.empty()) merge(Dictionary(other));
+}
+
+void Dictionary::merge(Dictionary&& other) {
   if (other.empty()) return;
   if (empty()) {
-    *this = other;
+    *this = std::move(other);
     return;
   }
-  std::vector<Entry> merged;
-  merged.reserve(size() + other.size());
-  const Entry* mine = begin();
-  for (const Entry& theirs : other) {
-    while (mine != end() && mine->key < theirs.key) merged.push_back(*mine++);
-    if (mine != end() && mine->key == theirs.key) ++mine;
-    merged.push_back(theirs);
+  if (!other._entries.isShared()) {
+    auto& theirs = other._entries.unique();
+    _entries = Shared(
+        mergedEntries(*this, std::make_move_iterator(theirs.begin()), std::make_move_iterator(theirs.end())));
+  } else {
+    const auto& theirs = *other._entries;
+    _entries = Shared(mergedEntries(*this, theirs.begin(), theirs.end()));
   }
-  merged.insert(merged.end(), mine, end());
-  _entries = Shared(std::move(merged));
 }
 
 bool Dictionary::operator==(const Dictionary& other) const {

@@ -97,6 +97,7 @@ class Dictionary {
   void remove(std::string_view key);
   /// Sets every entry of `other` here, over entries with the same keys.
   void merge(const Dictionary& other);
+  void merge(Dictionary&& other);
   bool operator==(const Dictionary& other) const;
 
  private:

@@ -34,7 +34,8 @@ struct DeflateFunctions {
                                                                     std::string_view data, platform::Log& log,
                                                                     const DeflateFunctions& zlib = {});
 
-/// The same in the gzip container.
+/// The same in the gzip container. Each thread that comes here keeps a stream, and an output buffer of at
+/// most 256 KiB, for the next time.
 [[nodiscard]] std::optional<std::string> gzipDeflate(std::string_view data, platform::Log& log);
 
 /// What the log says of a zlib code that ended the set-up, and of one that ended the compression.

@@ -15,7 +15,7 @@
 #include "backends/dashboard/Datagram.h"
 #include "framework/ClientSessionInterface.h"
 #include "integration/InspectionFixture.h"
-#include "platform/ipc/SdBusClientConnection.h"
+#include "platform/ipc/DBusClientConnection.h"
 #include "platform/queues/AsioQueues.h"
 #include "unit/backends/dashboard/LoopbackDashboard.h"
 
@@ -242,7 +242,7 @@ TEST_F(InspectionTest, TheClientsSocketDoesNotOfferIt) {
   TestDaemon daemon(root);
   platform::AsioQueues queues{1};
   const auto connection =
-      platform::SdBusClientConnection::connect(root.socket(), inspectionInterface(), queues);
+      platform::DBusClientConnection::connect(root.socket(), inspectionInterface(), queues);
   std::promise<std::optional<std::string>> answered;
   connection->call({static_cast<std::size_t>(InspectionMethod::Stats), {}, {}}, WatchedProcess::kPatience,
                    [&](auto reply) { answered.set_value(std::move(reply.error)); });

@@ -9,7 +9,7 @@
 
 #include "framework/ClientSessionInterface.h"
 #include "integration/TestDaemon.h"
-#include "platform/ipc/SdBusClientConnection.h"
+#include "platform/ipc/DBusClientConnection.h"
 #include "platform/queues/AsioQueues.h"
 
 namespace tallyd::test {
@@ -25,13 +25,13 @@ class GrantlessClient {
  public:
   explicit GrantlessClient(const TestRoot& root)
       : _connection(
-            platform::SdBusClientConnection::connect(root.socket(), clientSessionInterface(), _queues)) {}
+            platform::DBusClientConnection::connect(root.socket(), clientSessionInterface(), _queues)) {}
   ~GrantlessClient() { _connection->close(std::chrono::seconds(5)); }
   GrantlessClient(const GrantlessClient&) = delete;
   GrantlessClient& operator=(const GrantlessClient&) = delete;
 
   std::vector<Value> call(ClientSessionMethod method, std::vector<Value> arguments) {
-    std::promise<platform::SdBusClientConnection::Reply> answered;
+    std::promise<platform::DBusClientConnection::Reply> answered;
     _connection->call({static_cast<std::size_t>(method), std::move(arguments), {}}, WatchedProcess::kPatience,
                       [&](auto reply) { answered.set_value(std::move(reply)); });
     auto reply = answered.get_future().get();
@@ -46,7 +46,7 @@ class GrantlessClient {
 
  private:
   platform::AsioQueues _queues{1};
-  const std::shared_ptr<platform::SdBusClientConnection> _connection;
+  const std::shared_ptr<platform::DBusClientConnection> _connection;
 };
 
 class UploadTest : public testing::Test {

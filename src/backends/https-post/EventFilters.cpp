@@ -1,5 +1,7 @@
 #include "backends/https-post/EventFilters.h"
 
+#include <algorithm>
+
 #include "backends/TallyBackend.h"
 #include "platform/text/UnicodeText.h"
 
@@ -32,13 +34,17 @@ void EventFilters::createFiltersFromArray(const Array& filters) {
   if (filters.empty()) return;
   _rules.clear();
   _rulesByFoldedKey.clear();
+  _keyLengths.reset();
   _rules.reserve(filters.size());
   for (const Value& element : filters) {
     const Dictionary* rule = element.dictionary();
     _rules.push_back(rule ? compiled(*rule) : filterTag());
     const filterTag& tag = _rules.back();
     const bool hasKey = rule && rule->string("key");
-    if (hasKey) _rulesByFoldedKey[platform::caseFolded(tag.key)].push_back(_rules.size() - 1);
+    if (!hasKey) continue;
+    const std::string folded = platform::caseFolded(tag.key);
+    _rulesByFoldedKey[folded].push_back(_rules.size() - 1);
+    _keyLengths.set(std::min(folded.size(), kCountedLength));
   }
 }
 
@@ -58,6 +64,8 @@ void EventFilters::filterEvent(Dictionary& event) const {
 }
 
 const filterTag* EventFilters::ruleFor(std::string_view key, std::int64_t method, std::int64_t status) const {
+  // Folding leaves the length of ASCII as it is, and most fields have no rule.
+  if (!_keyLengths[std::min(key.size(), kCountedLength)] && platform::isASCII(key)) return nullptr;
   const auto found = _rulesByFoldedKey.find(platform::caseFolded(key));
   if (found == _rulesByFoldedKey.end()) return nullptr;
   for (const std::size_t index : found->second) {

@@ -1,6 +1,8 @@
 // The storebag's filter rules, compiled: which fields of an event are removed or hashed.
 #pragma once
 
+#include <bitset>
+#include <cstddef>
 #include <cstdint>
 #include <string>
 #include <string_view>
@@ -49,6 +51,8 @@ class EventFilters {
   /// Indices into `_rules` by their case-folded key, in the order of the storebag: a field's cost does not
   /// grow with the number of rules for other fields.
   std::unordered_map<std::string, std::vector<std::size_t>> _rulesByFoldedKey;
+  static constexpr std::size_t kCountedLength = 63;  ///< Longer keys count as this long.
+  std::bitset<kCountedLength + 1> _keyLengths;       ///< Lengths in bytes that folded keys have.
 };
 
 }  // namespace tallyd

@@ -216,23 +216,24 @@ platform::Dictionary HTTPSPostBackend::createEventDictfromPayload(const Payload&
                                                                   const timeval& timestamp,
                                                                   std::uint16_t method,
                                                                   std::uint16_t respCode,
-                                                                  std::uint16_t eventID) const {
-  return eventRecord(payload, {.sessionStart = _startTimeStamp,
-                               .sender = codeForClientType(_compType),
-                               .clientVersion = _clientVersion,
-                               .sessionID = _combinedSessionIDString.value_or(std::to_string(_sessionID)),
-                               .eventNumber = eventID,
-                               .method = method,
-                               .status = respCode,
-                               .eventTime = secondsFromTimeval(timestamp),
-                               .productFamily = _productFamily,
-                               .productModel = _hardwareType,
-                               .osVersion = _productVersion,
-                               .build = _buildVersion,
-                               .isInternal = _isInternal,
-                               .reportVersionMajor = _selfVersionMajor,
-                               .reportVersionMinor = _selfVersionMinor,
-                               .timezoneOffset = _platform.locale.offsetFromGMT(_platform.clock.now())});
+                                                                  std::uint16_t eventID) {
+  const std::string sessionID = _combinedSessionIDString.value_or(std::to_string(_sessionID));
+  return _records.record(payload, {.sessionStart = _startTimeStamp,
+                                   .sender = codeForClientType(_compType),
+                                   .clientVersion = _clientVersion,
+                                   .sessionID = sessionID,
+                                   .eventNumber = eventID,
+                                   .method = method,
+                                   .status = respCode,
+                                   .eventTime = secondsFromTimeval(timestamp),
+                                   .productFamily = _productFamily,
+                                   .productModel = _hardwareType,
+                                   .osVersion = _productVersion,
+                                   .build = _buildVersion,
+                                   .isInternal = _isInternal,
+                                   .reportVersionMajor = _selfVersionMajor,
+                                   .reportVersionMinor = _selfVersionMinor,
+                                   .timezoneOffset = _platform.locale.offsetFromGMT(_platform.clock.now())});
 }
 
 void HTTPSPostBackend::batchEvent(Dictionary event, const MessageNumbers& numbers) {

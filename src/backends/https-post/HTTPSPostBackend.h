@@ -9,6 +9,7 @@
 
 #include "backends/TallyBackend.h"
 #include "backends/https-post/EventFilters.h"
+#include "backends/https-post/EventRecord.h"
 #include "backends/https-post/ReportingRules.h"
 #include "platform/HTTPClient.h"
 
@@ -74,8 +75,7 @@ class HTTPSPostBackend final : public TallyBackend {
 
   Payload stopMessagePayload(const Payload& payload) const;
   Dictionary createEventDictfromPayload(const Payload& payload, const timeval& timestamp,
-                                        std::uint16_t method, std::uint16_t respCode,
-                                        std::uint16_t eventID) const;
+                                        std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID);
   void batchEvent(Dictionary event, const MessageNumbers& numbers);
   [[nodiscard]] bool hasRequiredUserInfo() const { return !_requireUserInfo || _userInfoDict; }
   /// Prepares and takes the batch away; what is left is no batch.
@@ -91,6 +91,7 @@ class HTTPSPostBackend final : public TallyBackend {
   const std::shared_ptr<platform::SerialQueue> _queue;
   std::optional<std::string> _postURL;
   std::optional<Events> _batchedEvents;  ///< Nothing until an event is held back, and after each flush.
+  EventRecords _records;
   EventFilters _filters;
   const bool _dnuEnabled;
   DNUType _dnuType = DNUTypeConsent;

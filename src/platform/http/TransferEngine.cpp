@@ -35,7 +35,7 @@ TransferEngine::Inbox::Answer TransferEngine::Inbox::add(WaitingRequest& request
   if (request.client.heldBytes > _maximumBytes - _heldBytes) return Answer::Full;
   _heldBytes += request.client.heldBytes;
   _requests.push_back(std::move(request));
-  return Answer::Taken;
+  return _requests.size() == 1 ? Answer::TakenAsFirst : Answer::Taken;
 }
 
 void TransferEngine::Inbox::takeAll(std::deque<WaitingRequest>& waiting) {
@@ -89,7 +89,8 @@ void TransferEngine::submit(HTTPRequest request, std::shared_ptr<SerialQueue> qu
       std::move(request),
       {std::move(queue), std::move(completion), heldBytes, steady_clock::now() + patience}};
   const Inbox::Answer answer = _inbox.add(waiting);
-  if (answer == Inbox::Answer::Taken) {
+  if (answer == Inbox::Answer::Taken) return;  // Whoever brought the first has woken the thread.
+  if (answer == Inbox::Answer::TakenAsFirst) {
     std::call_once(_threadStarted, [this] { startThread(); });
     curl_multi_wakeup(_multi.get());
     return;

@@ -56,7 +56,7 @@ class TransferEngine {
   /// What submitters and the thread share.
   class Inbox {
    public:
-    enum class Answer { Taken, Full, Closed };
+    enum class Answer { TakenAsFirst, Taken, Full, Closed };
     explicit Inbox(std::size_t maximumBytes) : _maximumBytes(maximumBytes) {}
 
     [[nodiscard]] Answer add(WaitingRequest& request);  ///< Moves from `request` when it is taken.

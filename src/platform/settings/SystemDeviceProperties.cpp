@@ -76,6 +76,11 @@ std::optional<std::string> SystemDeviceProperties::uniqueDeviceID() const {
 }
 
 std::optional<UUIDBytes> SystemDeviceProperties::machineIdentifier(std::string_view purpose) const {
+  {
+    const std::lock_guard lock(_identifiersMutex);
+    const auto known = _identifiers.find(purpose);
+    if (known != _identifiers.end()) return known->second;
+  }
   const auto id = _machine.machineID();
   const auto digest = id ? keyedDigest(*id, purpose) : std::nullopt;
   if (!digest) return std::nullopt;
@@ -83,7 +88,8 @@ std::optional<UUIDBytes> SystemDeviceProperties::machineIdentifier(std::string_v
   std::copy_n(digest->begin(), uuid.size(), uuid.begin());
   uuid[6] = static_cast<std::uint8_t>((uuid[6] & 0x0F) | 0x40);
   uuid[8] = static_cast<std::uint8_t>((uuid[8] & 0x3F) | 0x80);
-  return uuid;
+  const std::lock_guard lock(_identifiersMutex);
+  return _identifiers.try_emplace(std::string(purpose), uuid).first->second;
 }
 
 }  // namespace tallyd::platform

@@ -1,7 +1,10 @@
 // Facts about this device from its configuration and its system.
 #pragma once
 
+#include <map>
 #include <memory>
+#include <mutex>
+#include <string>
 
 #include "platform/Log.h"
 #include "platform/Root.h"
@@ -25,7 +28,8 @@ class PropertyListFile;
 /// | SerialNumber | DMI product serial, else the device tree's "serial-number" |
 /// | DeviceName | the kind of chassis, as in "laptop" |
 ///
-/// Nothing is kept but device.plist's contents. Threading: any thread; each question blocks on the disk.
+/// Kept are device.plist's contents and, since a machine's ID never changes while it runs, the identifiers
+/// that were derived from it, one for each purpose. Threading: any thread; each question blocks on the disk.
 class SystemDeviceProperties : public DeviceProperties {
  public:
   /// Borrows `log`. The system's own files are read below `systemRoot`. Touches no file.
@@ -43,6 +47,8 @@ class SystemDeviceProperties : public DeviceProperties {
 
   const MachineFacts _machine;
   const std::unique_ptr<PropertyListFile> _configured;
+  mutable std::mutex _identifiersMutex;
+  mutable std::map<std::string, UUIDBytes, std::less<>> _identifiers;  ///< By purpose.
 };
 
 }  // namespace tallyd::platform

@@ -14,20 +14,6 @@
 namespace tallyd::platform {
 namespace {
 
-// Nearly all text is ASCII, where every rule of Unicode's comes down to one on single bytes.
-bool isASCII(std::string_view text) {
-  constexpr std::uint64_t kHighBits = 0x8080808080808080;
-  std::uint64_t seen = 0;
-  while (text.size() >= sizeof seen) {
-    std::uint64_t word = 0;
-    std::memcpy(&word, text.data(), sizeof word);
-    seen |= word;
-    text.remove_prefix(sizeof word);
-  }
-  for (const char c : text) seen |= static_cast<unsigned char>(c);
-  return (seen & kHighBits) == 0;
-}
-
 char lowercasedASCII(char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c + ('a' - 'A')) : c; }
 
 bool equalIgnoringASCIICase(char a, char b) { return lowercasedASCII(a) == lowercasedASCII(b); }
@@ -44,6 +30,20 @@ std::string utf8(const icu::UnicodeString& text) {
 }
 
 }  // namespace
+
+// Nearly all text is, and every rule of Unicode's then comes down to one on single bytes.
+bool isASCII(std::string_view text) {
+  constexpr std::uint64_t kHighBits = 0x8080808080808080;
+  std::uint64_t seen = 0;
+  while (text.size() >= sizeof seen) {
+    std::uint64_t word = 0;
+    std::memcpy(&word, text.data(), sizeof word);
+    seen |= word;
+    text.remove_prefix(sizeof word);
+  }
+  for (const char c : text) seen |= static_cast<unsigned char>(c);
+  return (seen & kHighBits) == 0;
+}
 
 std::string lowercased(std::string_view text) {
   if (!isASCII(text)) return utf8(unicode(text).toLower(icu::Locale::getRoot()));

@@ -9,6 +9,8 @@ namespace tallyd::platform {
 
 /// All arguments are UTF-8; ill-formed sequences count as the replacement character U+FFFD.
 
+[[nodiscard]] bool isASCII(std::string_view text);
+
 /// Lower case by the Unicode Standard's default mapping.
 [[nodiscard]] std::string lowercased(std::string_view text);
 

@@ -15,7 +15,7 @@
 
 #include "fakes/FakeLog.h"
 #include "framework/ClientSessionInterface.h"
-#include "platform/ipc/SdBusListener.h"
+#include "platform/ipc/DBusListener.h"
 #include "platform/queues/AsioQueues.h"
 
 namespace tallyd {
@@ -114,7 +114,7 @@ class ScriptedDaemon final : public platform::ListenerDelegate {
   bool _invalidated = false;
   fakes::FakeLog _log;
   platform::AsioQueues _queues{2};
-  platform::SdBusListener _listener;
+  platform::DBusListener _listener;
 };
 
 }  // namespace tallyd

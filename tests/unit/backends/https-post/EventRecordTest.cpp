@@ -36,14 +36,14 @@ ShiftedTimes timesOf(double sessionStart, double eventTime) {
   EventFacts given = facts();
   given.sessionStart = sessionStart;
   given.eventTime = eventTime;
-  const Dictionary record = eventRecord(std::nullopt, given);
+  const Dictionary record = EventRecords().record(std::nullopt, given);
   EXPECT_EQ(record.string("eventTime"), record.string("_clientTS"));
   return {std::string(record.string("_startTS").value_or("")),
           std::string(record.string("_clientTS").value_or(""))};
 }
 
 TEST(EventRecordTest, HoldsEveryFactUnderItsKeyAsTextAndTheTimeZoneAsNumber) {
-  EXPECT_EQ(eventRecord(std::nullopt, facts()), (Dictionary{{"_startTS", "1768478400"},
+  EXPECT_EQ(EventRecords().record(std::nullopt, facts()), (Dictionary{{"_startTS", "1768478400"},
                                                             {"_sender", "DH"},
                                                             {"_clientVersion", "12"},
                                                             {"_sessionID", "77"},
@@ -116,7 +116,7 @@ TEST(EventRecordTest, KeepsPayloadFieldsAndOverwritesThoseOfItsOwnNames) {
                            {"eventTime", 1},
                            {"_sender", "other"},
                            {"list", platform::Array{1}}};
-  const Dictionary record = eventRecord(payload, facts());
+  const Dictionary record = EventRecords().record(payload, facts());
   EXPECT_EQ(record.integer("bitrate"), 500);
   EXPECT_EQ(*record.find("list"), Value(platform::Array{1}));
   EXPECT_EQ(record.string("_method"), "3");
@@ -130,7 +130,7 @@ TEST(EventRecordTest, LeavesMissingDeviceFactsOutAlsoWhereThePayloadHasThem) {
   given.productFamily = given.productModel = given.osVersion = given.build = std::nullopt;
   const Dictionary payload{
       {"_productFamily", "a"}, {"_productModel", "b"}, {"_osVersion", "c"}, {"_build", "d"}};
-  const Dictionary record = eventRecord(payload, given);
+  const Dictionary record = EventRecords().record(payload, given);
   for (const char* key : {"_productFamily", "_productModel", "_osVersion", "_build"}) {
     EXPECT_FALSE(record.contains(key)) << key;
   }
@@ -142,7 +142,7 @@ TEST(EventRecordTest, WritesTheLargestNumbersWhole) {
   given.clientVersion = given.eventNumber = given.method = given.status = 65'535;
   given.reportVersionMajor = given.reportVersionMinor = 255;
   given.isInternal = true;
-  const Dictionary record = eventRecord(std::nullopt, given);
+  const Dictionary record = EventRecords().record(std::nullopt, given);
   for (const char* key : {"_clientVersion", "_eventNumber", "_method", "_status"}) {
     EXPECT_EQ(record.string(key), "65535") << key;
   }
@@ -153,10 +153,41 @@ TEST(EventRecordTest, WritesTheLargestNumbersWhole) {
 TEST(EventRecordTest, GivesTheTimeZoneAsANumberThatMayBeNegative) {
   EventFacts given = facts();
   given.timezoneOffset = std::chrono::seconds(-34'200);
-  const Dictionary record = eventRecord(std::nullopt, given);
+  const Dictionary record = EventRecords().record(std::nullopt, given);
   ASSERT_TRUE(record.contains("_timezoneOffset"));
   EXPECT_TRUE(record.find("_timezoneOffset")->isInteger());
   EXPECT_EQ(record.integer("_timezoneOffset"), -34'200);
+}
+
+TEST(EventRecordTest, FollowsFactsThatChangeFromEventToEvent) {
+  EventRecords records;
+  EventFacts given = facts();
+  const auto sameAsAlone = [&](const std::optional<Dictionary>& payload) {
+    return records.record(payload, given) == EventRecords().record(payload, given);
+  };
+  EXPECT_TRUE(sameAsAlone(std::nullopt));
+  given.sessionID = "P.77";
+  EXPECT_TRUE(sameAsAlone(Dictionary{{"a", 1}}));
+  given.build = std::nullopt;
+  EXPECT_TRUE(sameAsAlone(Dictionary{{"_build", "of the payload"}}));
+  given.build = "12D501";
+  given.eventNumber = 6;
+  EXPECT_TRUE(sameAsAlone(Dictionary{{"_build", "of the payload"}}));
+  given.sessionStart += 60;
+  given.isInternal = true;
+  given.reportVersionMinor = 43;
+  EXPECT_TRUE(sameAsAlone(std::nullopt));
+}
+
+TEST(EventRecordTest, KeepsTextsOfItsOwnForTheNextComparison) {
+  EventRecords records;
+  EventFacts given = facts();
+  std::string session = "first";
+  given.sessionID = session;
+  EXPECT_EQ(records.record(std::nullopt, given).string("_sessionID"), "first");
+  session = "other";  // In the same place, and of the same length.
+  given.sessionID = session;
+  EXPECT_EQ(records.record(std::nullopt, given).string("_sessionID"), "other");
 }
 
 }  // namespace

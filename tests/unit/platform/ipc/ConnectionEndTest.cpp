@@ -197,7 +197,7 @@ class ForeignServiceTest : public testing::Test {
     std::strncpy(address.sun_path, _path.c_str(), sizeof address.sun_path - 1);
     EXPECT_EQ(::bind(_listening.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
     EXPECT_EQ(::listen(_listening.get(), 1), 0);
-    _client = SdBusClientConnection::connect(_path, testInterface(), _queues);
+    _client = DBusClientConnection::connect(_path, testInterface(), _queues);
     _client->setInterruptionHandler([this] { _events.add("interrupted"); });
     _client->setInvalidationHandler([this] { _events.add("invalidated"); });
     _served = FileDescriptor(::accept4(_listening.get(), nullptr, nullptr, SOCK_CLOEXEC));
@@ -214,7 +214,7 @@ class ForeignServiceTest : public testing::Test {
     EXPECT_EQ(::write(_served.get(), bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
   }
   void callAndExpectFailure() {
-    _client->call({kNothing, {}, {}}, std::chrono::seconds(60), [this](SdBusClientConnection::Reply reply) {
+    _client->call({kNothing, {}, {}}, std::chrono::seconds(60), [this](DBusClientConnection::Reply reply) {
       _events.add(reply.error ? "failed" : "answered");
     });
   }
@@ -228,7 +228,7 @@ class ForeignServiceTest : public testing::Test {
   FileDescriptor _listening;
   AsioQueues _queues{1};
   TestEvents _events;
-  std::shared_ptr<SdBusClientConnection> _client;
+  std::shared_ptr<DBusClientConnection> _client;
   FileDescriptor _served;
 };
 
@@ -277,10 +277,10 @@ TEST_F(ForeignServiceTest, CloseDoesNotWaitForAServiceThatDoesNotTakeWhatWasCall
   EXPECT_EQ(_events.all(), std::vector<std::string>{"failed"});
 }
 
-TEST(SdBusClientConnectionTest, NamesThePathThatItCannotConnectTo) {
+TEST(DBusClientConnectionTest, NamesThePathThatItCannotConnectTo) {
   AsioQueues queues(1);
   try {
-    SdBusClientConnection::connect("/nonexistent/service", testInterface(), queues);
+    DBusClientConnection::connect("/nonexistent/service", testInterface(), queues);
     FAIL();
   } catch (const std::system_error& error) {
     EXPECT_EQ(error.code().value(), ENOENT);

@@ -12,13 +12,13 @@
 #include "TestService.h"
 #include "fakes/FakeLog.h"
 #include "fakes/TemporaryFolder.h"
-#include "platform/ipc/SdBusClientConnection.h"
+#include "platform/ipc/DBusClientConnection.h"
 
 namespace tallyd::platform {
 
 class IPCTest : public testing::Test {
  protected:
-  using Reply = SdBusClientConnection::Reply;
+  using Reply = DBusClientConnection::Reply;
   static constexpr std::chrono::milliseconds kTimeout{60'000};
 
   IPCTest() { _service.resume(); }
@@ -26,12 +26,12 @@ class IPCTest : public testing::Test {
     for (const auto& client : _clients) client->close(std::chrono::seconds(5));
   }
 
-  std::shared_ptr<SdBusClientConnection> makeClient() {
-    return _clients.emplace_back(SdBusClientConnection::connect(_socketPath, testInterface(), _clientQueues));
+  std::shared_ptr<DBusClientConnection> makeClient() {
+    return _clients.emplace_back(DBusClientConnection::connect(_socketPath, testInterface(), _clientQueues));
   }
 
   /// Calls and waits for the answer.
-  Reply call(SdBusClientConnection& client, TestMethod method, std::vector<Value> arguments = {},
+  Reply call(DBusClientConnection& client, TestMethod method, std::vector<Value> arguments = {},
              std::vector<FileDescriptor> descriptors = {}, std::chrono::milliseconds timeout = kTimeout) {
     auto promise = std::make_shared<std::promise<Reply>>();
     client.call({method, std::move(arguments), std::move(descriptors)}, timeout,
@@ -44,7 +44,7 @@ class IPCTest : public testing::Test {
   fakes::FakeLog _log;
   TestService _service{_socketPath, _log};
   AsioQueues _clientQueues{1};
-  std::vector<std::shared_ptr<SdBusClientConnection>> _clients;
+  std::vector<std::shared_ptr<DBusClientConnection>> _clients;
 };
 
 }  // namespace tallyd::platform

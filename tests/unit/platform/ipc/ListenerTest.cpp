@@ -18,10 +18,10 @@ class ListenerTest : public testing::Test {
  protected:
   void expectServed(const std::filesystem::path& path) {
     AsioQueues queues(1);
-    const auto client = SdBusClientConnection::connect(path, testInterface(), queues);
+    const auto client = DBusClientConnection::connect(path, testInterface(), queues);
     std::promise<bool> answered;
     client->call({kNothing, {}, {}}, std::chrono::seconds(60),
-                 [&](SdBusClientConnection::Reply reply) { answered.set_value(!reply.error); });
+                 [&](DBusClientConnection::Reply reply) { answered.set_value(!reply.error); });
     EXPECT_TRUE(answered.get_future().get());
     client->close(std::chrono::seconds(5));
   }

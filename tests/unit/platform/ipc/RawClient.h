@@ -17,7 +17,7 @@
 #include <string_view>
 
 #include "platform/FileDescriptor.h"
-#include "platform/ipc/StreamPosition.h"
+#include "platform/dbus/Message.h"
 
 namespace tallyd::platform {
 
@@ -142,12 +142,12 @@ class RawClient {
   /// One whole message; nothing at the end or the deadline.
   std::optional<std::string> receiveMessage() const {
     std::string message;
-    std::size_t size = StreamPosition::kHeaderSize;
+    std::size_t size = dbus::kFixedHeaderBytes;
     while (message.size() < size) {
       const auto more = receive(size - message.size());
       if (more.empty()) return std::nullopt;
       message += more;
-      if (const auto header = StreamPosition::header(message)) size = header->size;
+      if (const auto length = dbus::messageLength(message); length > 0) size = length;
     }
     return message;
   }

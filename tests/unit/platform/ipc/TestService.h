@@ -14,7 +14,7 @@
 
 #include "platform/IPC.h"
 #include "platform/Log.h"
-#include "platform/ipc/SdBusListener.h"
+#include "platform/ipc/DBusListener.h"
 #include "platform/queues/AsioQueues.h"
 
 namespace tallyd::platform {
@@ -164,7 +164,7 @@ class TestService final : public ListenerDelegate {
 
  private:
   AsioQueues _queues{2};
-  SdBusListener _listener;
+  DBusListener _listener;
 };
 
 }  // namespace tallyd::platform

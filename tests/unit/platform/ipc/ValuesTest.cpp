@@ -3,8 +3,8 @@
 #include <limits>
 
 #include "IPCTest.h"
-#include "platform/ipc/BusHandles.h"
-#include "platform/ipc/ValueReader.h"
+#include "SdBusHandles.h"
+#include "SdBusValueReader.h"
 
 namespace tallyd::platform {
 namespace {
@@ -18,7 +18,7 @@ class ValuesTest : public IPCTest {
     return reply.results.empty() ? Value("no answer") : reply.results[0];
   }
 
-  std::shared_ptr<SdBusClientConnection> _client = makeClient();
+  std::shared_ptr<DBusClientConnection> _client = makeClient();
 };
 
 TEST_F(ValuesTest, EveryKindOfValueComesBackTheSame) {
@@ -217,7 +217,7 @@ TEST_F(ForeignValuesTest, VariantsNestedTooDeeplyAreInvalid) {
 }
 
 TEST_F(ForeignValuesTest, AMessageOfVeryManyValuesIsInvalid) {
-  constexpr std::size_t kBytes = (kMaximumValuesInMessage + 1) * sizeof(std::int16_t);
+  constexpr std::size_t kBytes = (dbus::kMaximumValuesInMessage + 1) * sizeof(std::int16_t);
   const auto message = newCall("Echo");
   void* space = nullptr;
   ASSERT_GE(sd_bus_message_open_container(message.get(), 'v', "an"), 0);

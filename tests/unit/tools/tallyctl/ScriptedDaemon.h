@@ -12,7 +12,7 @@
 #include "fakes/FakeLog.h"
 #include "framework/ClientSessionInterface.h"
 #include "platform/IPC.h"
-#include "platform/ipc/SdBusListener.h"
+#include "platform/ipc/DBusListener.h"
 #include "platform/queues/AsioQueues.h"
 
 namespace tallyd::tallyctl {
@@ -137,7 +137,7 @@ class ScriptedDaemon final : public platform::ListenerDelegate {
   mutable std::mutex _mutex;
   std::vector<Call> _calls;
   platform::AsioQueues _queues{2};
-  platform::SdBusListener _listener;
+  platform::DBusListener _listener;
 };
 
 }  // namespace tallyd::tallyctl

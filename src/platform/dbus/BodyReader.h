@@ -1,6 +1,8 @@
-// Arguments and results of D-Bus messages, read as values.
+// Arguments and results in D-Bus messages, read as values.
 #pragma once
 
+#include <bit>
+#include <cstddef>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -8,19 +10,15 @@
 
 #include "platform/FileDescriptor.h"
 #include "platform/Value.h"
-#include "platform/ipc/BusHandles.h"
 
-namespace tallyd::platform {
+namespace tallyd::platform::dbus {
 
-/// Containers nested deeper than this are refused, variants counted: sd-bus, on the other side of most
-/// sockets, refuses them too, and the stack is safe.
+/// Containers nested deeper than this are refused, variants counted: other implementations refuse them too,
+/// and the stack is safe.
 inline constexpr int kMaximumContainerDepth = 128;
 /// A message that holds more single values is refused: two bytes on the wire may cost many times that in
 /// memory.
 inline constexpr std::size_t kMaximumValuesInMessage = 4'000'000;
-
-/// The length of the first complete type of a valid signature; 0 for an empty one.
-[[nodiscard]] std::size_t completeTypeLength(std::string_view signature);
 
 struct ReadValues {
   std::vector<Value> values;  ///< One for each complete type.
@@ -33,6 +31,9 @@ struct ReadValues {
 /// Integers of every width become integers, "ay" data, the structure "(d)" a date, the empty signature null,
 /// "a{sX}" a dictionary and any other array an array; a variant is what it holds. Descriptors are read where
 /// the signature itself has them (their value is null), never within a variant. Nothing else has a value.
-[[nodiscard]] ReadValues readValues(sd_bus_message* message, std::string_view signature);
+///
+/// @param descriptors  what came with the message; those that the body refers to are moved out.
+[[nodiscard]] ReadValues readBody(std::string_view body, std::endian order, std::string_view signature,
+                                  std::vector<FileDescriptor> descriptors);
 
-}  // namespace tallyd::platform
+}  // namespace tallyd::platform::dbus

@@ -17,15 +17,15 @@ class Queues;
 /// When no descriptor or memory is left it says so in one critical line, pauses, and tries again until every
 /// client that waits has been served; connections that exist go on meanwhile. Threading: setDelegate() and
 /// resume() on one thread; the destructor waits for a delegate call that is under way.
-class SdBusListener final : public Listener {
+class DBusListener final : public Listener {
  public:
   /// Makes the socket's folder and takes the socket (see ListeningSocket for what it throws). Borrows queues
   /// and log.
-  SdBusListener(const std::filesystem::path& socketPath, Queues& queues, Log& log,
-                SocketAccess access = SocketAccess::Everybody);
-  ~SdBusListener() override;
-  SdBusListener(const SdBusListener&) = delete;
-  SdBusListener& operator=(const SdBusListener&) = delete;
+  DBusListener(const std::filesystem::path& socketPath, Queues& queues, Log& log,
+               SocketAccess access = SocketAccess::Everybody);
+  ~DBusListener() override;
+  DBusListener(const DBusListener&) = delete;
+  DBusListener& operator=(const DBusListener&) = delete;
 
   void setDelegate(ListenerDelegate& delegate) override;
   void resume() override;

@@ -1,4 +1,4 @@
-#include "platform/ipc/ValueReader.h"
+#include "SdBusValueReader.h"
 
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -6,6 +6,8 @@
 
 #include <cerrno>
 #include <cstring>
+
+#include "platform/dbus/Signature.h"
 
 namespace tallyd::platform {
 
@@ -52,7 +54,7 @@ class Reader {
   class Level {
    public:
     explicit Level(int& depth) : _depth(depth) {
-      if (++_depth > kMaximumContainerDepth) throw Unreadable{"nested too deeply"};
+      if (++_depth > dbus::kMaximumContainerDepth) throw Unreadable{"nested too deeply"};
     }
     ~Level() { --_depth; }
     Level(const Level&) = delete;
@@ -165,32 +167,19 @@ class Reader {
 
   sd_bus_message* const _message;
   std::vector<FileDescriptor>& _descriptors;
-  std::size_t _valuesLeft = kMaximumValuesInMessage;
+  std::size_t _valuesLeft = dbus::kMaximumValuesInMessage;
   int _depth = 0;
   bool _inVariant = false;
 };
 
 }  // namespace
 
-std::size_t completeTypeLength(std::string_view signature) {
-  std::size_t length = 0;
-  while (length < signature.size() && signature[length] == SD_BUS_TYPE_ARRAY) ++length;
-  int open = 0;
-  while (length < signature.size()) {
-    const char type = signature[length++];
-    if (type == '(' || type == '{') ++open;
-    if (type == ')' || type == '}') --open;
-    if (open == 0) break;
-  }
-  return length;
-}
-
-ReadValues readValues(sd_bus_message* message, std::string_view signature) {
-  ReadValues result;
+dbus::ReadValues readValues(sd_bus_message* message, std::string_view signature) {
+  dbus::ReadValues result;
   try {
     Reader reader(message, result.descriptors);
     while (!signature.empty()) {
-      const auto length = completeTypeLength(signature);
+      const auto length = dbus::completeTypeLength(signature);
       result.values.push_back(reader.read(std::string(signature.substr(0, length))));
       signature.remove_prefix(length);
     }

@@ -1,4 +1,4 @@
-#include "platform/ipc/SdBusListener.h"
+#include "platform/ipc/DBusListener.h"
 
 #include <sys/socket.h>
 
@@ -10,7 +10,7 @@
 
 #include "platform/Log.h"
 #include "platform/SerialQueue.h"
-#include "platform/ipc/SdBusServiceConnection.h"
+#include "platform/ipc/DBusServiceConnection.h"
 
 namespace tallyd::platform {
 
@@ -21,13 +21,13 @@ constexpr std::chrono::milliseconds kPauseWithoutResources{250};
 
 }  // namespace
 
-class SdBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
+class DBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
  public:
   Acceptor(const std::filesystem::path& socketPath, Queues& queues, Log& log, SocketAccess access)
       : _socket(socketPath, access),
         _log(log),
         _queue(queues.makeSerialQueue("com.quillon.tallyd.listener")),
-        _shared(std::make_shared<SdBusServiceConnection::Shared>(queues)) {}
+        _queues(queues) {}
 
   void setDelegate(ListenerDelegate& delegate) { _delegate = &delegate; }
 
@@ -55,7 +55,7 @@ class SdBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
   }
 
   void welcome(FileDescriptor client) {
-    const auto connection = std::make_shared<SdBusServiceConnection>(std::move(client), _shared, ++_accepted);
+    const auto connection = std::make_shared<DBusServiceConnection>(std::move(client), _queues, ++_accepted);
     if (_delegate) _delegate->shouldAcceptNewConnection(connection);
   }
 
@@ -76,7 +76,7 @@ class SdBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
   const ListeningSocket _socket;
   Log& _log;
   const std::shared_ptr<SerialQueue> _queue;
-  const std::shared_ptr<SdBusServiceConnection::Shared> _shared;
+  Queues& _queues;
   ListenerDelegate* _delegate = nullptr;
 
   std::mutex _mutex;  ///< Held while accepting, so that stop() waits for it.
@@ -86,14 +86,14 @@ class SdBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
   std::uint64_t _accepted = 0;
 };
 
-SdBusListener::SdBusListener(const std::filesystem::path& socketPath, Queues& queues, Log& log,
-                             SocketAccess access)
+DBusListener::DBusListener(const std::filesystem::path& socketPath, Queues& queues, Log& log,
+                           SocketAccess access)
     : _acceptor(std::make_shared<Acceptor>(socketPath, queues, log, access)) {}
 
-SdBusListener::~SdBusListener() { _acceptor->stop(); }
+DBusListener::~DBusListener() { _acceptor->stop(); }
 
-void SdBusListener::setDelegate(ListenerDelegate& delegate) { _acceptor->setDelegate(delegate); }
+void DBusListener::setDelegate(ListenerDelegate& delegate) { _acceptor->setDelegate(delegate); }
 
-void SdBusListener::resume() { _acceptor->listen(); }
+void DBusListener::resume() { _acceptor->listen(); }
 
 }  // namespace tallyd::platform

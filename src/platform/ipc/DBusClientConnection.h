@@ -15,7 +15,7 @@
 #include <vector>
 
 #include "platform/IPC.h"
-#include "platform/ipc/BusConnection.h"
+#include "platform/ipc/DBusConnection.h"
 
 namespace tallyd::platform {
 
@@ -24,7 +24,7 @@ namespace tallyd::platform {
 ///
 /// Calls leave in the order in which they were made, those made before authentication is over as soon as it
 /// is. Threading: any thread; close() not on the connection's queue.
-class SdBusClientConnection final : public BusConnection {
+class DBusClientConnection final : public DBusConnection {
  public:
   enum class Outcome {
     Answered,
@@ -47,8 +47,8 @@ class SdBusClientConnection final : public BusConnection {
   };
 
   /// Connects; borrows queues and interface. Throws std::system_error that names the path.
-  static std::shared_ptr<SdBusClientConnection> connect(const std::filesystem::path& socketPath,
-                                                        const Interface& interface, Queues& queues);
+  static std::shared_ptr<DBusClientConnection> connect(const std::filesystem::path& socketPath,
+                                                       const Interface& interface, Queues& queues);
 
   /// A socket that is connected to the service's. Waits up to `patience` while the service is too busy to
   /// take it (zero: not at all). Throws std::system_error that names the path.
@@ -56,9 +56,8 @@ class SdBusClientConnection final : public BusConnection {
                                         std::chrono::milliseconds patience);
 
   /// Borrows the interface; start() begins.
-  SdBusClientConnection(FileDescriptor socket, const Interface& interface,
-                        std::shared_ptr<SerialQueue> queue);
-  ~SdBusClientConnection();
+  DBusClientConnection(FileDescriptor socket, const Interface& interface, std::shared_ptr<SerialQueue> queue);
+  ~DBusClientConnection();
 
   /// Called when the connection breaks within a message; not after close().
   void setInterruptionHandler(std::function<void()> handler);
@@ -74,7 +73,7 @@ class SdBusClientConnection final : public BusConnection {
 
   // For an owner that works on the connection's queue and keeps waiting calls itself. All on the queue.
 
-  using BusConnection::start;
+  void start();
   /// `ready` runs whenever a call would leave at once, first when authentication is over; it returns whether
   /// it made one. `ended` runs last, also after finish() and abort(). Before the start.
   void setOwner(std::function<bool()> ready, std::function<void(bool withinMessage)> ended);
@@ -84,30 +83,38 @@ class SdBusClientConnection final : public BusConnection {
   void abort();   ///< Ends at once; what has no answer fails.
 
  private:
-  struct Pending;
+  using Moment = std::chrono::steady_clock::time_point;
+
+  /// A call that waits for its answer.
+  struct Pending {
+    std::size_t methodIndex;
+    std::chrono::milliseconds timeout;
+    Moment deadline;
+    Completion completion;
+  };
   struct Waiting {
     Request request;
     std::chrono::milliseconds timeout;
     Completion completion;
   };
 
-  void setUp(sd_bus* bus) override;
-  bool incoming(sd_bus_message*) override { return false; }
-  bool settled() override;
+  void incoming(const dbus::Message& message, std::vector<FileDescriptor> descriptors) override;
+  bool drained() override;
   void ended(End end) override;
 
   void submit(Waiting call);
   void send(Waiting call);
   bool sendWaiting();
-  static int handleReply(sd_bus_message* message, void* pending, void* error) noexcept;
-  [[nodiscard]] Reply failedReply(const char* name, const char* message,
-                                  std::chrono::milliseconds timeout) const;
-  void complete(std::uint64_t number, Reply reply);
+  [[nodiscard]] static Reply replyOf(const dbus::Message& message, std::string_view signature);
+  void complete(std::uint32_t serial, Reply reply);
+  void watchDeadline(Moment deadline);
+  void expire();
 
   const Interface& _interface;
-  std::deque<Waiting> _waiting;  ///< Until authentication is over, and while the library's queue is full.
-  std::map<std::uint64_t, std::unique_ptr<Pending>> _pending;  ///< In the order of the calls.
-  std::uint64_t _lastNumber = 0;
+  std::deque<Waiting> _waiting;  ///< Until authentication is over, and while too much waits to be sent.
+  std::map<std::uint32_t, Pending> _pending;  ///< By serial number.
+  std::unique_ptr<Source> _timer;             ///< While a call waits for its answer.
+  Moment _timerMoment{};
   bool _brokeOff = false;  ///< Ended while nobody was closing it.
   bool _over = false;
   bool _closing = false;

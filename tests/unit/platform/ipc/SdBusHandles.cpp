@@ -1,4 +1,4 @@
-#include "platform/ipc/BusHandles.h"
+#include "SdBusHandles.h"
 
 #include <systemd/sd-bus.h>
 

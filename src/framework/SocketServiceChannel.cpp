@@ -1,38 +1,38 @@
-#include "framework/SdBusServiceChannel.h"
+#include "framework/SocketServiceChannel.h"
 
 #include <system_error>
 #include <utility>
 
-#include "platform/ipc/SdBusClientConnection.h"
+#include "platform/ipc/DBusClientConnection.h"
 
 namespace tallyd {
 
+using platform::DBusClientConnection;
 using platform::FileDescriptor;
-using platform::SdBusClientConnection;
 
 namespace {
 
-TallyError kindOf(SdBusClientConnection::Outcome outcome) {
+TallyError kindOf(DBusClientConnection::Outcome outcome) {
   switch (outcome) {
-    case SdBusClientConnection::Outcome::Answered:
+    case DBusClientConnection::Outcome::Answered:
       return TallyError::None;
-    case SdBusClientConnection::Outcome::Rejected:
+    case DBusClientConnection::Outcome::Rejected:
       return TallyError::Rejected;
-    case SdBusClientConnection::Outcome::NotSent:
+    case DBusClientConnection::Outcome::NotSent:
       return TallyError::Argument;
-    case SdBusClientConnection::Outcome::TimedOut:
+    case DBusClientConnection::Outcome::TimedOut:
       return TallyError::TimedOut;
-    case SdBusClientConnection::Outcome::Disconnected:
+    case DBusClientConnection::Outcome::Disconnected:
       return TallyError::Disconnected;
   }
   return TallyError::Disconnected;
 }
 
-class SdBusServiceChannel final : public ServiceChannel {
+class SocketServiceChannel final : public ServiceChannel {
  public:
-  SdBusServiceChannel(FileDescriptor socket, std::shared_ptr<platform::SerialQueue> queue, Events events)
+  SocketServiceChannel(FileDescriptor socket, std::shared_ptr<platform::SerialQueue> queue, Events events)
       : _connection(
-            std::make_shared<SdBusClientConnection>(std::move(socket), clientSessionInterface(), queue)) {
+            std::make_shared<DBusClientConnection>(std::move(socket), clientSessionInterface(), queue)) {
     _connection->setOwner(std::move(events.ready), std::move(events.ended));
     // The first event must not come before the owner has the channel.
     queue->async([connection = _connection] { connection->start(); });
@@ -42,9 +42,9 @@ class SdBusServiceChannel final : public ServiceChannel {
 
   void call(ServiceRequest request, std::chrono::milliseconds timeout,
             ServiceCompletion completion) override {
-    SdBusClientConnection::Completion translated;
+    DBusClientConnection::Completion translated;
     if (completion) {
-      translated = [completion = std::move(completion)](SdBusClientConnection::Reply reply) {
+      translated = [completion = std::move(completion)](DBusClientConnection::Reply reply) {
         completion({kindOf(reply.outcome), std::move(reply.error).value_or(""), std::move(reply.results)});
       };
     }
@@ -57,19 +57,19 @@ class SdBusServiceChannel final : public ServiceChannel {
   void abort() override { _connection->abort(); }
 
  private:
-  const std::shared_ptr<SdBusClientConnection> _connection;
+  const std::shared_ptr<DBusClientConnection> _connection;
 };
 
 }  // namespace
 
 FileDescriptor connectedSocket(const std::filesystem::path& path, std::chrono::milliseconds patience) {
-  return SdBusClientConnection::connectedSocket(path, patience);
+  return DBusClientConnection::connectedSocket(path, patience);
 }
 
 ServiceConnector socketConnector(std::filesystem::path path, std::shared_ptr<platform::SerialQueue> queue) {
   return [path = std::move(path), queue = std::move(queue)](ServiceChannel::Events events) {
-    return std::make_shared<SdBusServiceChannel>(
-        SdBusClientConnection::connectedSocket(path, std::chrono::milliseconds::zero()), queue,
+    return std::make_shared<SocketServiceChannel>(
+        DBusClientConnection::connectedSocket(path, std::chrono::milliseconds::zero()), queue,
         std::move(events));
   };
 }
@@ -79,7 +79,7 @@ ServiceConnector oneTimeConnector(FileDescriptor socket, std::shared_ptr<platfor
   const auto kept = std::make_shared<FileDescriptor>(std::move(socket));
   return [kept, queue = std::move(queue)](ServiceChannel::Events events) {
     if (!*kept) throw std::system_error(std::make_error_code(std::errc::not_connected));
-    return std::make_shared<SdBusServiceChannel>(std::move(*kept), queue, std::move(events));
+    return std::make_shared<SocketServiceChannel>(std::move(*kept), queue, std::move(events));
   };
 }
 
