@@ -17,10 +17,11 @@ function(tallyd_program name)
   target_link_libraries(${name} PRIVATE ${ARG_LINKS})
 endfunction()
 
-# tallyd_test(NAME SOURCES … LINKS … [LABELS …] [PROGRAMS …]): a test program with Google Test; every case is one test
-# of ctest's. PROGRAMS are targets that must be built first and are found through TALLYD_BIN_DIR.
+# tallyd_test(NAME SOURCES … LINKS … [LABELS …] [LOCKS …] [PROGRAMS …]): a test program with Google Test; every case is
+# one test of ctest's. Cases that share a LOCK do not run at the same time. PROGRAMS are targets that must be built first
+# and are found through TALLYD_BIN_DIR.
 function(tallyd_test name)
-  cmake_parse_arguments(ARG "" "" "SOURCES;LINKS;LABELS;PROGRAMS" ${ARGN})
+  cmake_parse_arguments(ARG "" "" "SOURCES;LINKS;LABELS;LOCKS;PROGRAMS" ${ARGN})
   add_executable(${name} ${ARG_SOURCES})
   set_target_properties(${name} PROPERTIES RUNTIME_OUTPUT_DIRECTORY ${PROJECT_BINARY_DIR}/tests/bin)
   target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR}/src ${PROJECT_SOURCE_DIR}/tests)
@@ -31,5 +32,13 @@ function(tallyd_test name)
   if(ARG_PROGRAMS)
     add_dependencies(${name} ${ARG_PROGRAMS})
   endif()
-  gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST PROPERTIES LABELS "${ARG_LABELS}")
+  # A property without a value would take the next one's name for it.
+  set(properties)
+  if(ARG_LABELS)
+    list(APPEND properties LABELS "${ARG_LABELS}")
+  endif()
+  if(ARG_LOCKS)
+    list(APPEND properties RESOURCE_LOCK "${ARG_LOCKS}")
+  endif()
+  gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST PROPERTIES ${properties})
 endfunction()

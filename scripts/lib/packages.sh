@@ -21,6 +21,10 @@ TEST_PACKAGES=(
   file bash-completion shellcheck groff-base man-db openssl curl procps ca-certificates tzdata
 )
 
+# The compiler with the fuzzing engine, and its sanitizers' runtime libraries.
+# shellcheck disable=SC2034  # As above.
+FUZZ_PACKAGES=(clang-14 libclang-rt-14-dev)
+
 die() {
   printf '%s: %s\n' "$(basename "$0")" "$*" >&2
   exit 1

@@ -65,6 +65,9 @@ class TallyBackend {
   /// Before the first message.
   virtual void setAccount(std::shared_ptr<Account> account) { _account = std::move(account); }
 
+  /// From now on, consent that is withdrawn stops what needs it. Before the first message.
+  virtual void recheckConsent() {}
+
   /// Called once, before the session drops the backend.
   virtual void cleanup() {}
   /// Takes "MAJOR.MINOR…"; each part is cut to 8 bits, a part that is no number is 0.

@@ -1,7 +1,10 @@
 #include "daemon/ProductionPlatform.h"
 
+#include <optional>
+
 #include "platform/code-bundles/DlopenCodeBundles.h"
 #include "platform/http/CurlHTTPClient.h"
+#include "platform/http/RetryingHTTPClient.h"
 #include "platform/power-log/FilePowerLog.h"
 #include "platform/queues/AsioQueues.h"
 #include "platform/settings/FileBundle.h"
@@ -21,8 +24,9 @@ constexpr std::string_view kFrameworkBundle = "/usr/share/tally/Tally.framework"
 
 struct ProductionPlatform::Services {
   Services(const platform::Root& root, platform::Log& log, const platform::Clock& clock,
-           platform::Sandbox& sandbox)
-      : http(root, queues, log),
+           platform::Sandbox& sandbox, unsigned retryPosts)
+      : curl(root, queues, log),
+        http(withRetries(retryPosts, clock, log)),
         preferences(root, log),
         defaults(root, log),
         device(root, log),
@@ -32,10 +36,18 @@ struct ProductionPlatform::Services {
         platform{root,     log,    clock,           randomness, locale,   queues,      http,   preferences,
                  defaults, device, frameworkBundle, sandbox,    powerLog, codeBundles, process} {}
 
+  /// The client that everybody uses; without retries it is libcurl's own.
+  platform::HTTPClient& withRetries(unsigned attempts, const platform::Clock& clock, platform::Log& log) {
+    if (attempts == 0) return curl;
+    return retrying.emplace(curl, clock, randomness, log, platform::RetryLimits{.attempts = attempts});
+  }
+
   platform::SystemRandomness randomness;
   platform::SystemLocale locale;
   platform::AsioQueues queues;
-  platform::CurlHTTPClient http;
+  platform::CurlHTTPClient curl;
+  std::optional<platform::RetryingHTTPClient> retrying;
+  platform::HTTPClient& http;
   platform::FilePreferences preferences;
   platform::FileUserDefaults defaults;
   platform::SystemDeviceProperties device;
@@ -47,8 +59,9 @@ struct ProductionPlatform::Services {
 };
 
 ProductionPlatform::ProductionPlatform(const platform::Root& root, platform::Log& log,
-                                       const platform::Clock& clock, platform::Sandbox& sandbox)
-    : _services(std::make_unique<Services>(root, log, clock, sandbox)) {}
+                                       const platform::Clock& clock, platform::Sandbox& sandbox,
+                                       unsigned retryPosts)
+    : _services(std::make_unique<Services>(root, log, clock, sandbox, retryPosts)) {}
 
 ProductionPlatform::~ProductionPlatform() = default;
 

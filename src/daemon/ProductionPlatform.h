@@ -12,8 +12,9 @@ namespace tallyd {
 class ProductionPlatform {
  public:
   /// Borrows all four; they must outlive this object.
+  /// @param retryPosts  how many more attempts a post gets that failed for a while.
   ProductionPlatform(const platform::Root& root, platform::Log& log, const platform::Clock& clock,
-                     platform::Sandbox& sandbox);
+                     platform::Sandbox& sandbox, unsigned retryPosts = 0);
   ~ProductionPlatform();
 
   [[nodiscard]] const platform::Platform& platform() const;

@@ -31,6 +31,15 @@ void removeFrom(std::vector<std::shared_ptr<TallydSession>>& sessions, const Tal
   std::erase_if(sessions, [&](const auto& held) { return held.get() == &session; });
 }
 
+BackendFactory backendFactory(ConsentChecks consentChecks) {
+  if (consentChecks == ConsentChecks::AtStart) return TallyBackend::newBackendWithName;
+  return [](const auto&... entry) {
+    auto backend = TallyBackend::newBackendWithName(entry...);
+    if (backend) backend->recheckConsent();
+    return backend;
+  };
+}
+
 }  // namespace
 
 std::string correlationKeyForUserInfo(const std::optional<platform::Dictionary>& userInfo) {
@@ -40,8 +49,13 @@ std::string correlationKeyForUserInfo(const std::optional<platform::Dictionary>&
   return name(kTallyUserInfoClientName) + ":" + name(kTallyUserInfoServiceName);
 }
 
-TallydAgent::TallydAgent(const platform::Platform& platform, std::shared_ptr<Ledger> ledger)
-    : _platform(platform), _ledger(std::move(ledger)), _messageLog(platform), _cachedStorebags(platform) {}
+TallydAgent::TallydAgent(const platform::Platform& platform, std::shared_ptr<Ledger> ledger,
+                         const AgentOptions& options)
+    : _platform(platform),
+      _ledger(std::move(ledger)),
+      _newBackend(backendFactory(options.consentChecks)),
+      _messageLog(platform),
+      _cachedStorebags(platform, options.fatalFailures) {}
 
 TallydAgent::~TallydAgent() = default;
 
@@ -50,13 +64,14 @@ bool TallydAgent::shouldAcceptNewConnection(const std::shared_ptr<platform::Serv
   asl_log(_platform.log, LogLevel::Debug, "Accepting new XPC connection {}, {}({}) connections.",
           connection->description(), sessions, groups);
   _ledger->connectionAccepted();
-  const auto session = std::make_shared<TallydSession>(*this, _platform, _messageLog,
-                                                       TallyBackend::newBackendWithName, _ledger->openBook());
+  const auto session =
+      std::make_shared<TallydSession>(*this, _platform, _messageLog, _newBackend, _ledger->openBook());
   connection->setExportedInterface(clientSessionInterface());
   connection->setExportedObject(std::make_shared<ClientSessionExport>(session, _platform.sandbox));
   {
     const std::lock_guard lock(_mutex);
     _sessionList.push_back(session);
+    _connections.emplace(session.get(), connection);
   }
   connection->setInterruptionHandler([this, session] {
     asl_log(_platform.log, LogLevel::Debug, "XPC connection to {} was interrupted", session->description());
@@ -64,6 +79,17 @@ bool TallydAgent::shouldAcceptNewConnection(const std::shared_ptr<platform::Serv
   connection->setInvalidationHandler([this, session] { connectionInvalidated(session); });
   connection->resume();
   return true;
+}
+
+void TallydAgent::endSessions() {
+  std::vector<std::shared_ptr<platform::ServiceConnection>> connections;
+  {
+    const std::lock_guard lock(_mutex);
+    for (const auto& [session, connection] : _connections) connections.push_back(connection.lock());
+  }
+  for (const auto& connection : connections) {
+    if (connection) connection->finish();
+  }
 }
 
 std::pair<std::size_t, std::size_t> TallydAgent::counts() {
@@ -78,6 +104,7 @@ void TallydAgent::connectionInvalidated(const std::shared_ptr<TallydSession>& se
   // The caller holds the session: no reference that goes here is the last.
   const std::lock_guard lock(_mutex);
   removeFrom(_sessionList, *session);
+  _connections.erase(session.get());
   if (const auto group = _correlatedSessions.find(key); group != _correlatedSessions.end()) {
     removeFrom(group->second, *session);
   }

@@ -9,13 +9,22 @@
 #include <utility>
 #include <vector>
 
+#include "platform/Fatal.h"
 #include "platform/IPC.h"
+#include "session/BackendSetup.h"
 #include "session/TallydSessionDelegate.h"
 #include "storebag/StorebagCache.h"
+#include "support/Consent.h"
 #include "support/Ledger.h"
 #include "support/MessageLog.h"
 
 namespace tallyd {
+
+/// What an operator may ask for; by default nothing.
+struct AgentOptions {
+  platform::FatalFailures fatalFailures = platform::FatalFailures::EndProcess;
+  ConsentChecks consentChecks = ConsentChecks::AtStart;
+};
 
 /// One per process, for its whole life.
 ///
@@ -28,10 +37,14 @@ class TallydAgent final : public platform::ListenerDelegate, public TallydSessio
  public:
   /// Borrows the platform. `ledger` gets a book for every session.
   explicit TallydAgent(const platform::Platform& platform,
-                       std::shared_ptr<Ledger> ledger = std::make_shared<Ledger>());
+                       std::shared_ptr<Ledger> ledger = std::make_shared<Ledger>(),
+                       const AgentOptions& options = {});
   ~TallydAgent() override;
 
   bool shouldAcceptNewConnection(const std::shared_ptr<platform::ServiceConnection>& connection) override;
+
+  /// Ends every connection, and with it its session, as if the client had left. Returns at once.
+  void endSessions();
 
   std::optional<platform::Dictionary> storebagForSession(const TallydSession& session) override;
   std::optional<std::string> storebagVersionForSession(const TallydSession& session) override;
@@ -56,10 +69,12 @@ class TallydAgent final : public platform::ListenerDelegate, public TallydSessio
 
   const platform::Platform& _platform;
   const std::shared_ptr<Ledger> _ledger;
+  const BackendFactory _newBackend;
   MessageLog _messageLog;
   StorebagCache _cachedStorebags;
   std::mutex _mutex;
   Sessions _sessionList;
+  std::unordered_map<const TallydSession*, std::weak_ptr<platform::ServiceConnection>> _connections;
   std::map<std::string, Sessions> _correlatedSessions;
   /// The group that a session is in, so that leaving it takes no walk through all of them.
   std::unordered_map<const TallydSession*, std::string> _groupOfSession;

@@ -1,4 +1,4 @@
-// The failures that end the process.
+// The failures that by design end the process.
 #pragma once
 
 #include <cstdlib>
@@ -7,11 +7,19 @@
 
 namespace tallyd::platform {
 
-/// Logs one critical line that names the reason and aborts.
+/// What such a failure costs.
+enum class FatalFailures {
+  EndProcess,   ///< The process.
+  FailRequest,  ///< Only the request that met it: the caller fails it, like any other failure would.
+};
+
+/// Logs one critical line that names the reason and aborts, unless only the request is to fail; then it
+/// returns.
 template <class... Arguments>
-[[noreturn]] void endProcess(Log& log, fmt::format_string<Arguments...> reason, Arguments&&... arguments) {
+void fatalFailure(Log& log, FatalFailures failures, fmt::format_string<Arguments...> reason,
+                  Arguments&&... arguments) {
   asl_log(log, LogLevel::Critical, reason, std::forward<Arguments>(arguments)...);
-  std::abort();
+  if (failures == FatalFailures::EndProcess) std::abort();
 }
 
 }  // namespace tallyd::platform

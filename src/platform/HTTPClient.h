@@ -42,6 +42,7 @@ struct HTTPResponse {
 
 enum class HTTPFailure {
   Transfer,      ///< The request, or the way to its response, failed.
+  Permanent,     ///< The request or what it leads to is at fault: the same request would fail again.
   TooMuchWaits,  ///< Nothing was tried: unfinished requests hold as much as they may.
 };
 

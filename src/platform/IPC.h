@@ -80,6 +80,9 @@ class ServiceConnection {
   /// Called once, last; the connection then drops its object and its handlers.
   virtual void setInvalidationHandler(std::function<void()> handler) = 0;
   virtual void resume() = 0;
+  /// Hears what the client has sent by now and then ends the connection, as if the client had left. A client
+  /// that does not read its answers is not waited for. After resume(); any thread.
+  virtual void finish() = 0;
 };
 
 class ListenerDelegate {

@@ -7,8 +7,12 @@
 #include <rapidjson/stringbuffer.h>
 #include <rapidjson/writer.h>
 
+#include <charconv>
+#include <cmath>
+#include <cstdlib>
 #include <cstring>
 #include <limits>
+#include <new>
 #include <vector>
 
 #include "platform/UTF8.h"
@@ -18,6 +22,30 @@ namespace tallyd::platform {
 namespace {
 
 // Writing
+
+/// Says that there is no memory left; RapidJSON, left to itself, would write where it got none.
+class ThrowingAllocator {
+ public:
+  [[maybe_unused]] static constexpr bool kNeedFree = true;  // For the library.
+
+  static void* Malloc(std::size_t size) { return size == 0 ? nullptr : checked(std::malloc(size)); }
+  static void* Realloc(void* memory, std::size_t /*size*/, std::size_t newSize) {
+    if (newSize > 0) return checked(std::realloc(memory, newSize));
+    std::free(memory);
+    return nullptr;
+  }
+  static void Free(void* memory) { std::free(memory); }
+  bool operator==(const ThrowingAllocator&) const { return true; }
+
+ private:
+  static void* checked(void* memory) {
+    if (!memory) throw std::bad_alloc();
+    return memory;
+  }
+};
+
+using JSONBuffer = rapidjson::GenericStringBuffer<rapidjson::UTF8<>, ThrowingAllocator>;
+using JSONWriter = rapidjson::Writer<JSONBuffer, rapidjson::UTF8<>, rapidjson::UTF8<>, ThrowingAllocator>;
 
 /// Whether eight bytes all stand for themselves in a JSON string: ASCII, no control, no quote, no backslash.
 bool standForThemselves(std::uint64_t bytes) {
@@ -47,9 +75,9 @@ std::size_t plainLength(std::string_view text) {
 
 /// RapidJSON's writer with strings that are copied run by run instead of byte by byte, and checked on the
 /// way.
-class ValueWriter : public rapidjson::Writer<rapidjson::StringBuffer> {
+class ValueWriter : public JSONWriter {
  public:
-  explicit ValueWriter(rapidjson::StringBuffer& buffer) : Writer(buffer) {}
+  explicit ValueWriter(JSONBuffer& buffer) : JSONWriter(buffer) {}
 
   bool write(const Value& value) { return value.visit(*this); }
 
@@ -142,16 +170,34 @@ class ValueWriter : public rapidjson::Writer<rapidjson::StringBuffer> {
 
 // Reading
 
+/// The number at the end of `text`; nothing for one that is too big.
+std::optional<double> numberThatEnds(std::string_view text) {
+  const auto before = text.find_last_not_of("0123456789+-.eE");
+  text.remove_prefix(before == std::string_view::npos ? 0 : before + 1);
+  double number = 0;
+  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
+  return error == std::errc() ? std::optional(number) : std::nullopt;
+}
+
 /// Builds a value from the reader's events; refuses what is nested too deep.
 class ValueBuilder : public rapidjson::BaseReaderHandler<rapidjson::UTF8<>, ValueBuilder> {
  public:
+  /// Borrows what is read, and where it has got to.
+  ValueBuilder(std::string_view text, const rapidjson::MemoryStream& stream) : _text(text), _stream(stream) {}
+
   bool Null() { return add(Value()); }
   bool Bool(bool value) { return add(Value(value)); }
   bool Int(int value) { return add(Value(value)); }
   bool Uint(unsigned value) { return add(Value(value)); }
   bool Int64(std::int64_t value) { return add(Value(value)); }
   bool Uint64(std::uint64_t value) { return add(Value(value)); }
-  bool Double(double value) { return add(Value(value)); }
+  bool Double(double value) {
+    // Of the largest numbers that there are the library makes none.
+    const auto exact =
+        std::isfinite(value) ? std::optional(value) : numberThatEnds(_text.substr(0, _stream.Tell()));
+    if (!exact) _isTooBig = true;
+    return exact && add(Value(*exact));
+  }
   bool String(const char* text, rapidjson::SizeType length, bool /*copy*/) {
     return add(Value(std::string(text, length)));
   }
@@ -173,6 +219,7 @@ class ValueBuilder : public rapidjson::BaseReaderHandler<rapidjson::UTF8<>, Valu
   }
 
   Value takeRoot() { return std::move(_root); }
+  [[nodiscard]] bool isTooBig() const { return _isTooBig; }  ///< Why the builder refused, if not for nesting.
 
  private:
   enum class Kind { Object, Array };
@@ -202,8 +249,11 @@ class ValueBuilder : public rapidjson::BaseReaderHandler<rapidjson::UTF8<>, Valu
     return true;
   }
 
+  const std::string_view _text;
+  const rapidjson::MemoryStream& _stream;
   std::vector<Open> _open;
   Value _root;
+  bool _isTooBig = false;
 };
 
 std::string errorText(rapidjson::ParseErrorCode code, std::size_t offset) {
@@ -216,7 +266,7 @@ std::string errorText(rapidjson::ParseErrorCode code, std::size_t offset) {
 }  // namespace
 
 std::optional<std::string> jsonFromValue(const Value& value) {
-  rapidjson::StringBuffer buffer;
+  JSONBuffer buffer;
   ValueWriter writer(buffer);
   if (!writer.write(value)) return std::nullopt;
   return std::string(buffer.GetString(), buffer.GetSize());
@@ -229,9 +279,10 @@ JSONResult valueFromJSON(std::string_view text) {
   text.remove_prefix(skipped);
   rapidjson::MemoryStream stream(text.data(), text.size());
   rapidjson::Reader reader;
-  ValueBuilder builder;
+  ValueBuilder builder(text, stream);
   if (!reader.Parse<kFlags>(stream, builder)) {
-    return {std::nullopt, errorText(reader.GetParseErrorCode(), skipped + reader.GetErrorOffset())};
+    const auto code = builder.isTooBig() ? rapidjson::kParseErrorNumberTooBig : reader.GetParseErrorCode();
+    return {std::nullopt, errorText(code, skipped + reader.GetErrorOffset())};
   }
   // The reader takes a NUL byte for the end.
   if (stream.Tell() < text.size()) {

@@ -1,6 +1,7 @@
 // Everything that an operating system gives to the daemon, in one object.
 #pragma once
 
+#include "platform/DatagramSocket.h"
 #include "platform/ProcessValues.h"
 #include "platform/Root.h"
 
@@ -40,6 +41,7 @@ struct Platform {
   PowerLog& powerLog;
   CodeBundles& codeBundles;
   ProcessValues& process;
+  DatagramSockets& datagrams = systemDatagramSockets();  ///< Another network only where a day is replayed.
 };
 
 }  // namespace tallyd::platform

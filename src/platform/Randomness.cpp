@@ -4,6 +4,14 @@
 
 namespace tallyd::platform {
 
+double uniformDraw(Randomness& randomness) {
+  constexpr int kRandomBytes = 6;  // All that stand before the UUID's version.
+  const UUIDBytes uuid = randomness.uuid();
+  double draw = 0;
+  for (int i = kRandomBytes - 1; i >= 0; --i) draw = (draw + uuid[static_cast<std::size_t>(i)]) / 256;
+  return draw;
+}
+
 std::string uuidText(const UUIDBytes& uuid) {
   std::string text;
   for (std::size_t i = 0; i < uuid.size(); ++i) {

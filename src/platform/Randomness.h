@@ -22,6 +22,9 @@ class Randomness {
   virtual UUIDBytes uuid() = 0;
 };
 
+/// A draw from [0, 1) that nobody can foresee; drand48() and its sequence stay as they are.
+[[nodiscard]] double uniformDraw(Randomness& randomness);
+
 /// The canonical text of a UUID, upper case, 36 characters.
 [[nodiscard]] std::string uuidText(const UUIDBytes& uuid);
 

@@ -1,6 +1,5 @@
 #include "storebag/StorebagCache.h"
 
-#include "platform/Fatal.h"
 #include "platform/Platform.h"
 #include "storebag/StorebagEnvironment.h"
 
@@ -8,6 +7,7 @@ namespace tallyd {
 
 using platform::asl_log;
 using platform::Dictionary;
+using platform::FatalFailures;
 using platform::LogLevel;
 
 StorebagDecision decideStorebag(const CachedStorebag* entry, platform::TimePoint now) {
@@ -50,17 +50,21 @@ std::optional<std::string> StorebagCache::version(std::int32_t clientType) const
 
 void StorebagCache::fetchAndCacheStorebag(std::int32_t clientType) {
   asl_log(_platform.log, LogLevel::Debug, "Fetching storebag for client type {}", clientType);
-  StorebagFetch fetch = fetchStorebagForClientType(_platform, clientType);
-  asl_log(_platform.log, LogLevel::Debug, "Storebag max age: {} seconds", fetch.maxAgeSeconds);
   const auto name = storebagNameForClientType(clientType);
+  // Nothing would be remembered of the attempt: in a process that goes on, a client could have the server
+  // asked as often as it likes.
+  const bool mayAsk = name || _fatalFailures == FatalFailures::EndProcess;
+  StorebagFetch fetch =
+      mayAsk ? fetchStorebagForClientType(_platform, clientType, _fatalFailures) : StorebagFetch();
+  asl_log(_platform.log, LogLevel::Debug, "Storebag max age: {} seconds", fetch.maxAgeSeconds);
   if (!name) {
-    platform::endProcess(_platform.log, "Client type {} has no storebag name to keep its storebag under",
-                         clientType);
+    platform::fatalFailure(_platform.log, _fatalFailures,
+                           "Client type {} has no storebag name to keep its storebag under", clientType);
   }
   if (!fetch.storebag) {
     asl_log(_platform.log, LogLevel::Critical, "Unable to fetch storebag for client type {}", clientType);
   }
-  store(*name, std::move(fetch));
+  if (name) store(*name, std::move(fetch));
 }
 
 std::optional<CachedStorebag> StorebagCache::entry(std::optional<std::string_view> name) const {

@@ -44,10 +44,12 @@ class StorebagCache {
   static constexpr std::chrono::seconds kMinimumWaitAfterFailure{900};
 
   /// Borrows the platform.
-  explicit StorebagCache(const platform::Platform& platform) : _platform(platform) {}
+  explicit StorebagCache(const platform::Platform& platform,
+                         platform::FatalFailures fatalFailures = platform::FatalFailures::EndProcess)
+      : _platform(platform), _fatalFailures(fatalFailures) {}
 
   /// The storebag, cached or fetched on the calling thread, which may block for up to 15 s. A client type
-  /// without a storebag name ends the process.
+  /// without a storebag name is a fatal failure; where the process goes on, it never has a storebag.
   [[nodiscard]] std::optional<platform::Dictionary> storebag(std::uint32_t sessionID,
                                                              std::int32_t clientType);
 
@@ -62,6 +64,7 @@ class StorebagCache {
   void store(std::string_view name, StorebagFetch fetch);
 
   const platform::Platform& _platform;
+  const platform::FatalFailures _fatalFailures;
   mutable std::mutex _mutex;
   std::map<std::string, CachedStorebag, std::less<>> _entries;
 };

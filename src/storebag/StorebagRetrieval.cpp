@@ -6,7 +6,6 @@
 
 #include "framework/Tally.h"
 #include "platform/Base64.h"
-#include "platform/Fatal.h"
 #include "platform/HTTPClient.h"
 #include "platform/Platform.h"
 #include "platform/Settings.h"
@@ -18,6 +17,7 @@ namespace tallyd {
 
 using platform::asl_log;
 using platform::Dictionary;
+using platform::FatalFailures;
 using platform::LogLevel;
 using platform::Platform;
 using platform::Value;
@@ -54,15 +54,17 @@ platform::HTTPResult requestStorebag(const Platform& platform, const std::string
   return result;
 }
 
-std::int32_t maxAgeOf(const Platform& platform, const std::optional<platform::HTTPResponse>& response) {
+/// Nothing for a header that ends in "max-age".
+std::optional<std::int32_t> maxAgeOf(const Platform& platform,
+                                     const std::optional<platform::HTTPResponse>& response,
+                                     FatalFailures fatalFailures) {
   const auto cacheControl = response ? response->header("Cache-Control") : std::nullopt;
   const CacheAge age = cacheAgeFromHeader(cacheControl);
-  if (age.endsInMaxAge) {
-    platform::endProcess(platform.log,
+  if (!age.endsInMaxAge) return age.maxAgeSeconds;
+  platform::fatalFailure(platform.log, fatalFailures,
                          "Cache-Control \"{}\" of the storebag server ends in max-age without a number",
                          *cacheControl);
-  }
-  return age.maxAgeSeconds;
+  return std::nullopt;
 }
 
 Dictionary parsedEnvelope(const Platform& platform, std::string_view body) {
@@ -111,10 +113,13 @@ const Dictionary* currentSection(const Platform& platform, const Dictionary& bag
   return bag.dictionary(*sectionName);
 }
 
-std::string versionOf(const Platform& platform, const Dictionary& bag, std::int32_t clientType) {
+std::optional<std::string> versionOf(const Platform& platform, const Dictionary& bag, std::int32_t clientType,
+                                     FatalFailures fatalFailures) {
   const Value* version = bag.find("version");
   if (!version) {
-    platform::endProcess(platform.log, "Storebag for client type {} has no version", clientType);
+    platform::fatalFailure(platform.log, fatalFailures, "Storebag for client type {} has no version",
+                           clientType);
+    return std::nullopt;
   }
   if (const auto text = version->string()) return std::string(*text);
   asl_log(platform.log, LogLevel::Warning, "Storebag version for client type {} is not a string", clientType);
@@ -140,11 +145,13 @@ CacheAge cacheAgeFromHeader(std::optional<std::string_view> cacheControl) {
 
 std::optional<Dictionary> fetchSignedStorebag(const Platform& platform,
                                               std::optional<std::string_view> storebagName,
-                                              std::int32_t& maxAgeSeconds) {
+                                              std::int32_t& maxAgeSeconds, FatalFailures fatalFailures) {
   const auto result = requestStorebag(platform, storebagURL(platform, storebagName));
   if (result.error) return std::nullopt;
   const Dictionary envelope = parsedEnvelope(platform, result.data.bytes());
-  maxAgeSeconds = maxAgeOf(platform, result.response);
+  const auto maxAge = maxAgeOf(platform, result.response, fatalFailures);
+  if (!maxAge) return std::nullopt;
+  maxAgeSeconds = *maxAge;
   const auto bag = verifiedBag(platform, envelope);
   if (!bag) return std::nullopt;
   const auto parsed = platform::propertyListWithData(*bag);
@@ -157,13 +164,15 @@ std::optional<Dictionary> fetchSignedStorebag(const Platform& platform,
   return *parsed.value->dictionary();
 }
 
-StorebagFetch fetchStorebagForClientType(const Platform& platform, std::int32_t clientType) {
+StorebagFetch fetchStorebagForClientType(const Platform& platform, std::int32_t clientType,
+                                         FatalFailures fatalFailures) {
   StorebagFetch fetch;
   if (clientType == 0) {
     asl_log(platform.log, LogLevel::Critical, "Could not find storebag name for client type {}", clientType);
     return fetch;
   }
-  const auto bag = fetchSignedStorebag(platform, storebagNameForClientType(clientType), fetch.maxAgeSeconds);
+  const auto bag = fetchSignedStorebag(platform, storebagNameForClientType(clientType), fetch.maxAgeSeconds,
+                                       fatalFailures);
   if (!bag) {
     asl_log(platform.log, LogLevel::Critical, "Could not fetch storebag for client type {}", clientType);
     return fetch;
@@ -176,8 +185,8 @@ StorebagFetch fetchStorebagForClientType(const Platform& platform, std::int32_t 
             sectionName.value_or(kNoText));
     return fetch;
   }
-  fetch.version = versionOf(platform, *bag, clientType);
-  fetch.storebag = *section;
+  fetch.version = versionOf(platform, *bag, clientType, fatalFailures);
+  if (fetch.version) fetch.storebag = *section;
   return fetch;
 }
 

@@ -6,6 +6,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/Fatal.h"
 #include "platform/Value.h"
 
 namespace tallyd::platform {
@@ -23,17 +24,19 @@ struct StorebagFetch {
 };
 
 /// Fetches, verifies and cuts out the current environment's section. Logs every failure. A bag that holds the
-/// section but no "version", and a "Cache-Control" that ends in "max-age", end the process.
+/// section but no "version", and a "Cache-Control" that ends in "max-age", are fatal failures; where the
+/// process goes on, the fetch has failed.
 ///
 /// Threading: any thread; blocks for up to 15 s.
-[[nodiscard]] StorebagFetch fetchStorebagForClientType(const platform::Platform& platform,
-                                                       std::int32_t clientType);
+[[nodiscard]] StorebagFetch fetchStorebagForClientType(
+    const platform::Platform& platform, std::int32_t clientType,
+    platform::FatalFailures fatalFailures = platform::FatalFailures::EndProcess);
 
 /// The verified bag under `storebagName`, all environments; nothing on failure. Writes `maxAgeSeconds` once a
-/// response arrived.
+/// response arrived that states one.
 [[nodiscard]] std::optional<platform::Dictionary> fetchSignedStorebag(
     const platform::Platform& platform, std::optional<std::string_view> storebagName,
-    std::int32_t& maxAgeSeconds);
+    std::int32_t& maxAgeSeconds, platform::FatalFailures fatalFailures = platform::FatalFailures::EndProcess);
 
 /// What a "Cache-Control" header allows.
 struct CacheAge {

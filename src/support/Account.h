@@ -107,7 +107,7 @@ class Account {
   [[nodiscard]] TapLine ownersLine(const Tap& tap, std::string_view kind) const;
   void showDrop(DropReason reason, std::uint64_t count, const std::optional<MessageNumbers>& message) const;
 
-  const AccountOwner _owner;
+  const AccountOwner _owner{};
   const std::shared_ptr<Tap> _tap;
   mutable std::mutex _mutex;
   AccountCounts _counts;

@@ -16,10 +16,11 @@ enum class DropReason : std::uint8_t {
   NoClientIdentifier,  ///< The document left without events, as the client has no identifier.
   PostFailed,          ///< The post ended with an error instead of a response.
   MemoryBound,         ///< The post was refused, as unfinished posts hold all the memory that they may.
+  ConsentWithdrawn,    ///< The user had consented when the session started, and does not any more.
   // Datagrams.
   QueueFull,    ///< The oldest of those that waited, when one more came.
   GivenUp,      ///< Not acknowledged after the last retransmission.
-  OutOfMemory,  ///< No memory for the datagram.
+  OutOfMemory,  ///< No memory for the datagram, or for the document that was to be posted.
   // Whatever a backend still had when it went.
   CleanUp,
   // Uploads.
@@ -36,12 +37,12 @@ enum class DropReason : std::uint8_t {
   NoSessionInfo,  ///< A one-shot message without the identifiers that it must have.
 };
 
-inline constexpr std::array<std::string_view, 19> kDropReasonNames{
-    "state-off",           "method-limit",  "not-postable",   "no-client-identifier",
-    "post-failed",         "memory-bound",  "queue-full",     "given-up",
-    "out-of-memory",       "clean-up",      "not-uploadable", "upload-failed",
-    "adaptor-unavailable", "adaptor-threw", "no-method",      "no-payload",
-    "no-backends",         "no-storebag",   "no-session-info"};
+inline constexpr std::array<std::string_view, 20> kDropReasonNames{
+    "state-off",     "method-limit",        "not-postable",      "no-client-identifier",
+    "post-failed",   "memory-bound",        "consent-withdrawn", "queue-full",
+    "given-up",      "out-of-memory",       "clean-up",          "not-uploadable",
+    "upload-failed", "adaptor-unavailable", "adaptor-threw",     "no-method",
+    "no-payload",    "no-backends",         "no-storebag",       "no-session-info"};
 inline constexpr std::size_t kDropReasonCount = kDropReasonNames.size();
 static_assert(static_cast<std::size_t>(DropReason::NoSessionInfo) + 1 == kDropReasonCount);
 

@@ -45,6 +45,20 @@ Ledger::Look Ledger::look() {
   return look;
 }
 
+SessionCounts Ledger::totals() {
+  const Look look = this->look();
+  SessionCounts total = look.ended;
+  for (const auto& book : look.unsettled) total += book->counts();
+  for (const auto& book : look.live) total += book->counts();
+  return total;
+}
+
+bool Ledger::isSettled() {
+  const std::lock_guard lock(_mutex);
+  sweep();
+  return _books.empty();
+}
+
 Dictionary Ledger::snapshot() {
   Look look = this->look();
   for (const auto& book : look.unsettled) look.ended += book->counts();

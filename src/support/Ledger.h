@@ -32,6 +32,11 @@ class Ledger {
   void connectionAccepted();
   void connectionEnded();
 
+  /// The sum of all sessions.
+  [[nodiscard]] SessionCounts totals();
+  /// Whether every session has ended and nothing that it took is under way any more.
+  [[nodiscard]] bool isSettled();
+
   /// A dictionary:
   /// "connections": {"accepted", "open"};
   /// "sessions": an array, each what SessionBook::description() and SessionCounts::dictionary() say;

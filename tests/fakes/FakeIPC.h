@@ -68,8 +68,13 @@ class FakeServiceConnection : public platform::ServiceConnection {
   void setInterruptionHandler(std::function<void()> handler) override { _interrupted = std::move(handler); }
   void setInvalidationHandler(std::function<void()> handler) override { _invalidated = std::move(handler); }
   void resume() override { _resumed = true; }
+  void finish() override {
+    ++finished;
+    invalidate();
+  }
 
   std::optional<uid_t> peer = 0;  ///< The user who connected.
+  int finished = 0;               ///< How often the service ended it.
 
   [[nodiscard]] const platform::Interface* exportedInterface() const { return _interface; }
   [[nodiscard]] bool resumed() const { return _resumed; }

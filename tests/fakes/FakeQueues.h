@@ -4,9 +4,11 @@
 #include <poll.h>
 
 #include <algorithm>
+#include <atomic>
 #include <deque>
 #include <map>
 #include <mutex>
+#include <utility>
 #include <vector>
 
 #include "platform/SerialQueue.h"
@@ -40,6 +42,17 @@ class FakeQueues : public platform::Queues {
     while (_state->fireNext(end)) run();
     _state->now = end;
   }
+  /// Moves the time on to what falls due next, and runs that; to `end`, and false, when nothing does until
+  /// then.
+  bool advanceToNext(Milliseconds end) {
+    run();
+    if (_state->fireNext(end)) {
+      run();
+      return true;
+    }
+    _state->now = std::max(_state->now, end);
+    return false;
+  }
   /// Calls the handlers of descriptors that have something to read, until none has, and runs all work.
   void serveReadable() {
     do run();
@@ -47,6 +60,8 @@ class FakeQueues : public platform::Queues {
   }
   [[nodiscard]] Milliseconds now() const { return _state->now; }
   [[nodiscard]] std::size_t armedTimers() const { return _state->timers.size(); }
+  /// Queues that somebody holds.
+  [[nodiscard]] std::size_t liveQueues() const { return _state->queues; }
 
   std::size_t blockingCalls = 0;
 
@@ -58,6 +73,7 @@ class FakeQueues : public platform::Queues {
     std::map<int, std::pair<int, Work>> readers;  ///< By their IDs: descriptor and handler.
     Milliseconds now{0};
     int nextID = 1;
+    std::atomic<std::size_t> queues = 0;
 
     void give(Work work) {
       const std::lock_guard lock(mutex);
@@ -180,7 +196,10 @@ class FakeQueues : public platform::Queues {
   class Queue : public platform::SerialQueue {
    public:
     Queue(std::shared_ptr<State> state, std::string label)
-        : _state(std::move(state)), _label(std::move(label)) {}
+        : _state(std::move(state)), _label(std::move(label)) {
+      ++_state->queues;
+    }
+    ~Queue() override { --_state->queues; }
     const std::string& label() const override { return _label; }
     void async(Work work) override { _state->give(std::move(work)); }
     void asyncAfter(Milliseconds delay, Work work) override { _state->arm(delay, std::move(work)); }

@@ -140,11 +140,12 @@ TEST_F(BadInputTest, TakesStorebagsWithValuesOfTheWrongType) {
     EXPECT_EQ(states.error, std::nullopt);
     EXPECT_EQ(states.value.value_or(std::vector<std::string>()), std::vector<std::string>()) << clientType;
   }
-  EXPECT_EQ(daemon.process().count("<3>Storebag entry splunk is not a dictionary"), 1U);
-  EXPECT_EQ(daemon.process().count("<3>Tally(HTTPSPostBackend): can't find the client list."), 1U);
-  EXPECT_EQ(daemon.process().count("<2>Could not find storebag for client type 7 with release environment"),
-            1U);
-  EXPECT_EQ(daemon.process().count("<2>Could not fetch storebag for client type 8"), 1U);
+  EXPECT_EQ(daemon.process().countOnce("<3>Storebag entry splunk is not a dictionary", 1), 1U);
+  EXPECT_EQ(daemon.process().countOnce("<3>Tally(HTTPSPostBackend): can't find the client list.", 1), 1U);
+  EXPECT_EQ(
+      daemon.process().countOnce("<2>Could not find storebag for client type 7 with release environment", 1),
+      1U);
+  EXPECT_EQ(daemon.process().countOnce("<2>Could not fetch storebag for client type 8", 1), 1U);
   EXPECT_TRUE(daemon.process().waitForLineStartingWith("<2>propertyListWithData error "));
   expectDaemonServes(daemon);
 }

@@ -28,7 +28,7 @@ class FatalFailureTest : public testing::Test {
 TEST_F(FatalFailureTest, EndsOnAStartBeforeAnyConfiguration) {
   TestDaemon daemon(root);
   EXPECT_EQ(endAfterStart(daemon, std::nullopt).signal, SIGABRT);
-  EXPECT_EQ(daemon.process().count("<2>Could not find storebag name for client type 0"), 1U);
+  EXPECT_EQ(daemon.process().countOnce("<2>Could not find storebag name for client type 0", 1), 1U);
   EXPECT_EQ(daemon.process().lines().back(),
             "<2>Client type 0 has no storebag name to keep its storebag under");
   EXPECT_EQ(storebags.http().requests().size(), 0U);

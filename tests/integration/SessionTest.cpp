@@ -100,7 +100,7 @@ TEST_F(SessionTest, HoldsEventsBackUntilTheFlush) {
   ASSERT_TRUE(collector.waitForRequests(1));
   const auto events = receivedEvents(collector);
   EXPECT_EQ(events.size(), 1U + 50U);  // The start record, and 50 of one method.
-  EXPECT_EQ(daemon.process().count("<7>HTTPSPostBackend: Dropping batched event (4)"), 10U);
+  EXPECT_EQ(daemon.process().countOnce("<7>HTTPSPostBackend: Dropping batched event (4)", 10), 10U);
 
   EXPECT_EQ(session->flushMessagesSync().value, std::nullopt);
   session->sendMessageSync(4, 0, Dictionary{{"i", 60}});
@@ -132,9 +132,9 @@ TEST_F(SessionTest, AnswersEveryOperation) {
       session->sendMessageWithSessionInfoSync(sessionInfo(8), std::nullopt, 5, 0, Dictionary{{"b", 2}}).value,
       "finished");
 
-  EXPECT_EQ(daemon.process().count("<2>File upload failed for " + file.string()), 1U);
-  EXPECT_EQ(daemon.process().count("<7>TallydSession: Uploading log data array: (line, 5)"), 1U);
-  EXPECT_EQ(daemon.process().count("<2>Log data array upload failed"), 1U);
+  EXPECT_EQ(daemon.process().countOnce("<2>File upload failed for " + file.string(), 1), 1U);
+  EXPECT_EQ(daemon.process().countOnce("<7>TallydSession: Uploading log data array: (line, 5)", 1), 1U);
+  EXPECT_EQ(daemon.process().countOnce("<2>Log data array upload failed", 1), 1U);
   std::string escaped = "file://" + file.string();
   escaped.replace(escaped.find(' '), 1, "%20");
   EXPECT_EQ(root.messageLog(), std::vector{"[uploadFileWithURL] Upload failed for file " + escaped});
@@ -221,7 +221,7 @@ TEST_F(SessionTest, NeverAnswersAOneShotSendWithoutIdentifiers) {
   // Calls are answered in order: once this one is, the one before it will never be.
   EXPECT_EQ(connection.fetchDisplayURLSync().value, "URL not available");
   EXPECT_EQ(answered.get_future().wait_for(std::chrono::seconds(0)), std::future_status::timeout);
-  EXPECT_EQ(daemon.process().count("<2>Could not retrieve identifiers from sessionInfo"), 1U);
+  EXPECT_EQ(daemon.process().countOnce("<2>Could not retrieve identifiers from sessionInfo", 1), 1U);
 }
 
 TEST_F(SessionTest, SendsAOneShotMessageWithoutStartOrStopRecord) {
@@ -252,7 +252,7 @@ TEST_F(SessionTest, ServesTheCachedStorebagWhileItIsFresh) {
   startedSession(daemon, sessionInfo(1));
   startedSession(daemon, sessionInfo(2));
   EXPECT_EQ(storebags.http().requests().size(), 1U);
-  EXPECT_EQ(daemon.process().count("<7>Cached storebag found for client type 5"), 1U);
+  EXPECT_EQ(daemon.process().countOnce("<7>Cached storebag found for client type 5", 1), 1U);
 }
 
 TEST_F(SessionTest, WaitsAfterAFailedFetch) {
@@ -266,9 +266,9 @@ TEST_F(SessionTest, WaitsAfterAFailedFetch) {
   EXPECT_EQ(storebags.http().requests().size(), 1U);
   EXPECT_TRUE(daemon.process().waitForLine(
       "<6>Not fetching storebag for client type 6 - must wait 900 seconds between attempts"));
-  EXPECT_EQ(daemon.process().count("<2>Signature is missing"), 1U);
+  EXPECT_EQ(daemon.process().countOnce("<2>Signature is missing", 1), 1U);
   EXPECT_EQ(connection->sendMessageSync(1, 0, Dictionary{{"a", 1}}).value, std::nullopt);
-  EXPECT_EQ(daemon.process().count("<7>No backends available to send message"), 1U);
+  EXPECT_EQ(daemon.process().countOnce("<7>No backends available to send message", 1), 1U);
 }
 
 TEST_F(SessionTest, DelaysNobodyWhileStorebagServersHang) {

@@ -73,6 +73,7 @@ class TestDaemon {
     std::map<std::string, std::string> environment{};
     std::optional<int> descriptorLimit{};
     int passedSocket = -1;
+    std::map<int, std::size_t> limits{};  ///< As WatchedProcess takes them.
   };
 
   explicit TestDaemon(const TestRoot& root) : TestDaemon(root, Options()) {}

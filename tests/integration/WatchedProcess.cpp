@@ -69,6 +69,10 @@ std::vector<std::string> mergedEnvironment(const std::map<std::string, std::stri
                        static_cast<rlim_t>(*options.descriptorLimit)};
     setrlimit(RLIMIT_NOFILE, &limit);
   }
+  for (const auto& [resource, value] : options.limits) {
+    const rlimit limit{value, value};
+    setrlimit(static_cast<__rlimit_resource>(resource), &limit);
+  }
   execve(arguments[0], arguments, environment);
   _exit(127);
 }
@@ -148,6 +152,11 @@ std::string WatchedProcess::output() const {
 std::size_t WatchedProcess::count(const std::string& line) const {
   const auto all = lines();
   return static_cast<std::size_t>(std::count(all.begin(), all.end(), line));
+}
+
+std::size_t WatchedProcess::countOnce(const std::string& line, std::size_t awaited) const {
+  (void)waitForLineCount(line, awaited);
+  return count(line);
 }
 
 bool WatchedProcess::waitForLine(const std::string& line) const { return waitForLineCount(line, 1); }

@@ -36,7 +36,8 @@ class WatchedProcess {
     std::map<std::string, std::string> environment{};  ///< Beside the test's own.
     std::string input{};
     std::optional<int> descriptorLimit{};  ///< RLIMIT_NOFILE.
-    int passedSocket = -1;                 ///< Becomes descriptor 3, as a service manager passes it.
+    std::map<int, std::size_t> limits{};  ///< Other resource limits (setrlimit(2)): RLIMIT_… and its value.
+    int passedSocket = -1;                ///< Becomes descriptor 3, as a service manager passes it.
   };
 
   explicit WatchedProcess(const Options& options);
@@ -52,6 +53,9 @@ class WatchedProcess {
   [[nodiscard]] std::vector<std::string> lines() const;
   [[nodiscard]] std::string output() const;
   [[nodiscard]] std::size_t count(const std::string& line) const;
+  /// As count(), once it is `awaited` or nothing more comes: what a program has written is read a little
+  /// later.
+  [[nodiscard]] std::size_t countOnce(const std::string& line, std::size_t awaited) const;
   /// Waits until a line equals `line`, or starts with it; false when none comes.
   [[nodiscard]] bool waitForLine(const std::string& line) const;
   [[nodiscard]] bool waitForLineStartingWith(const std::string& start) const;

@@ -9,9 +9,9 @@ mkdir "$units"
 cp "$source_folder"/packaging/systemd/tallyd.{service,socket} "$units"
 
 # The unit's program must be there to be verified.
-program=$(sed -n 's/^ExecStart=//p' "$units/tallyd.service")
+program=$(sed -n 's/^ExecStart=\([^ ]*\).*/\1/p' "$units/tallyd.service")
 expect_equal /usr/sbin/tallyd "$program" "the unit's program"
-sed -i "s|^ExecStart=.*|ExecStart=$build/bin/tallyd|" "$units/tallyd.service"
+sed -i "s|^ExecStart=[^ ]*|ExecStart=$build/bin/tallyd|" "$units/tallyd.service"
 systemd-analyze verify --man=no "$units/tallyd.service" "$units/tallyd.socket" >"$scratch/verify.log" 2>&1 || {
   show "$scratch/verify.log"
   fail "systemd does not take the units"
@@ -49,3 +49,14 @@ while read -r place; do
     *) grep -q "^d /$place 0" "$source_folder/packaging/systemd/tallyd.tmpfiles" || fail "nobody makes $place" ;;
   esac
 done <"$scratch/writable"
+
+# The daemon knows the options that the service gives it, and is not killed while it drains.
+read -ra options < <(sed -n 's/^ExecStart=[^ ]* *//p' "$service")
+"$build/bin/tallyd" "${options[@]}" --no-such-option >"$scratch/options.log" 2>&1 && fail "an unknown option is taken"
+grep -q 'not expected: --no-such-option$' "$scratch/options.log" || {
+  show "$scratch/options.log"
+  fail "the daemon does not take the service's options"
+}
+drain=$(grep -o -- '--drain [0-9]*' "$service" | cut -d' ' -f2)
+patience=$(sed -n 's/^TimeoutStopSec=//p' "$service")
+((patience > drain)) || fail "the service is killed after $patience s, and may drain for $drain s"

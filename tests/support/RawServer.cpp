@@ -34,17 +34,15 @@ bool RawConnection::readMore() {
 }
 
 std::string RawConnection::readRequest() {
-  std::size_t end = 0;
-  while ((end = _received.find("\r\n\r\n")) == std::string::npos) {
+  while (true) {
+    const auto size = requestSize(_received);
+    if (size && _received.size() >= *size) {
+      std::string request = _received.substr(0, *size);
+      _received.erase(0, *size);
+      return request;
+    }
     if (!readMore()) return {};
   }
-  const std::size_t size = end + 4 + contentLength(_received.substr(0, end + 4));
-  while (_received.size() < size) {
-    if (!readMore()) return {};
-  }
-  std::string request = _received.substr(0, size);
-  _received.erase(0, size);
-  return request;
 }
 
 void RawConnection::write(std::string_view bytes) {
@@ -58,6 +56,12 @@ void RawConnection::write(std::string_view bytes) {
 void RawConnection::waitForClose() {
   while (readMore()) {
   }
+}
+
+void RawConnection::reset() const {
+  // Dissolving the association is the way to an RST that needs no close(2) (connect(2)).
+  const sockaddr unspecified{.sa_family = AF_UNSPEC, .sa_data = {}};
+  ::connect(_descriptor, &unspecified, sizeof unspecified);
 }
 
 RawServer::RawServer(Script script)
@@ -97,6 +101,12 @@ void RawServer::runScript(Client& client, int number) {
   RawConnection connection(client.descriptor.get(), number);
   _script(connection);
   ::shutdown(client.descriptor.get(), SHUT_RDWR);
+}
+
+std::optional<std::size_t> requestSize(std::string_view bytes) {
+  const auto end = bytes.find("\r\n\r\n");
+  if (end == std::string_view::npos) return std::nullopt;
+  return end + 4 + contentLength(bytes.substr(0, end + 4));
 }
 
 platform::FileDescriptor listenOnLoopback() {

@@ -5,6 +5,7 @@
 #include <functional>
 #include <list>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <thread>
@@ -21,10 +22,15 @@ class RawConnection {
   /// The bytes of one request, header and body (of its Content-Length); empty when the client has hung up.
   [[nodiscard]] std::string readRequest();
   void write(std::string_view bytes);
+  /// Waits for the first bytes of a request and leaves them; false when the client has hung up.
+  [[nodiscard]] bool waitForBytes() { return !_received.empty() || readMore(); }
   /// Waits until the client hangs up or the server goes away.
   void waitForClose();
+  /// Closes the connection so that the client's next look at it is an error (TCP's RST).
+  void reset() const;
   /// Which accepted connection this is, from 1.
   [[nodiscard]] int number() const { return _number; }
+  [[nodiscard]] int descriptor() const { return _descriptor; }
 
  private:
   [[nodiscard]] bool readMore();
@@ -66,6 +72,10 @@ class RawServer {
   bool _stopping = false;
   std::thread _thread;
 };
+
+/// The size of the request that `bytes` starts with, header and body (of its Content-Length); nothing while
+/// its header is not whole.
+[[nodiscard]] std::optional<std::size_t> requestSize(std::string_view bytes);
 
 /// A socket that listens on 127.0.0.1 at a port that the system chose.
 [[nodiscard]] platform::FileDescriptor listenOnLoopback();

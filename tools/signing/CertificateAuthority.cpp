@@ -10,7 +10,8 @@ namespace tallyd::signing {
 
 namespace {
 
-constexpr long kOneDay = 24L * 60 * 60;
+constexpr long kOneHour = 60L * 60;
+constexpr long kOneDay = 24 * kOneHour;
 constexpr long kValidity = 3650 * kOneDay;
 constexpr long kX509Version3 = 2;
 
@@ -73,13 +74,18 @@ CertificateAuthority::CertificateAuthority(const std::string& commonName)
   _certificatePEM = signing::certificatePEM(_certificate.get());
 }
 
-TLSIdentity CertificateAuthority::issue(const std::vector<std::string>& subjectAltNames) const {
+TLSIdentity CertificateAuthority::issue(const std::vector<std::string>& subjectAltNames,
+                                        Validity validity) const {
   std::string names;
   for (const std::string& name : subjectAltNames) names += (names.empty() ? "" : ",") + name;
 
   const auto key = makeKey();
   const auto certificate =
       makeCertificate(key.get(), subjectAltNames.front().substr(subjectAltNames.front().find(':') + 1));
+  if (validity == Validity::Expired) {
+    requireOpenSSL(X509_gmtime_adj(X509_getm_notAfter(certificate.get()), -kOneHour) != nullptr,
+                   "dating a certificate");
+  }
   addExtension(certificate.get(), _certificate.get(), NID_basic_constraints, "critical,CA:FALSE");
   addExtension(certificate.get(), _certificate.get(), NID_key_usage, "critical,digitalSignature");
   addExtension(certificate.get(), _certificate.get(), NID_ext_key_usage, "serverAuth");

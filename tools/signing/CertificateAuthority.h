@@ -14,6 +14,9 @@ struct TLSIdentity {
   std::string keyPEM;
 };
 
+/// When a server's certificate counts: from a day ago for ten years, or until an hour ago.
+enum class Validity { Current, Expired };
+
 /// Makes certificates with EC P-256 keys (RFC 5480), good for ten years. Its own key is never written
 /// anywhere: once the object is gone, nobody can issue under it.
 ///
@@ -26,7 +29,8 @@ class CertificateAuthority {
 
   /// A certificate for a server.
   /// @param subjectAltNames  As in OpenSSL's configuration: "DNS:localhost", "IP:127.0.0.1"; not empty.
-  [[nodiscard]] TLSIdentity issue(const std::vector<std::string>& subjectAltNames) const;
+  [[nodiscard]] TLSIdentity issue(const std::vector<std::string>& subjectAltNames,
+                                  Validity validity = Validity::Current) const;
 
  private:
   OpenSSLPointer<EVP_PKEY> _key;

@@ -25,6 +25,23 @@ bool isPlain(char c) {
          std::string_view("._:/+-@%").find(c) != std::string_view::npos;
 }
 
+/// JSON with escapes also for DEL and for the controls of ISO/IEC 6429 (U+0080 to U+009F), which it leaves as
+/// they are.
+std::string withoutControls(std::string_view json) {
+  std::string quiet;
+  for (std::size_t i = 0; i < json.size(); ++i) {
+    const auto byteAt = [&](std::size_t at) { return static_cast<unsigned char>(json[at]); };
+    if (byteAt(i) == 0x7F) {
+      quiet += "\\u007f";
+    } else if (byteAt(i) == 0xC2 && i + 1 < json.size() && byteAt(i + 1) < 0xA0) {
+      quiet += fmt::format("\\u{:04x}", byteAt(++i));
+    } else {
+      quiet += json[i];
+    }
+  }
+  return quiet;
+}
+
 /// Fields that the reporting side adds itself; all others are the event's payload.
 bool isPayload(std::string_view key) { return !key.starts_with('_') && key != "eventTime"; }
 
@@ -60,7 +77,7 @@ struct JSONForm {
 
 std::string readableText(std::string_view text) {
   if (!text.empty() && std::all_of(text.begin(), text.end(), isPlain)) return std::string(text);
-  return platform::jsonFromValue(Value(text)).value_or("\"\"");
+  return withoutControls(platform::jsonFromValue(Value(text)).value_or("\"\""));
 }
 
 std::string readableValue(const Value* value) {

@@ -35,7 +35,7 @@ std::string_view startingBag() {
           <!-- Parts of service names with commas between them. Leave it out to match every service. -->
           <key>service</key>
           <string>call</string>
-          <!-- The session's level among the sessions of one process. -->
+          <!-- The session's level among the sessions of one client and service. -->
           <key>hierarchy</key>
           <integer>0</integer>
           <!-- 1 reports without the user's consent. -->

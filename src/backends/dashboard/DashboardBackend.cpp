@@ -1,7 +1,6 @@
 #include "backends/dashboard/DashboardBackend.h"
 
 #include <arpa/inet.h>
-#include <sys/socket.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -79,7 +78,7 @@ std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
     const std::optional<std::string>& serverIP, std::uint16_t serverPort,
     const std::optional<std::string>& productFamily) {
   if (profile && !namesServer(platform.log, *profile)) return nullptr;
-  platform::FileDescriptor socket(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, IPPROTO_UDP));
+  auto socket = platform.datagrams.makeSocket();
   if (!socket) {
     asl_log(platform.log, LogLevel::Error, "Tally(DashboardBackend): socket() failed ({:d})", errno);
     return nullptr;
@@ -93,7 +92,7 @@ std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
 
 DashboardBackend::DashboardBackend(const platform::Platform& platform, std::string_view name,
                                    const Payload& profile, const std::optional<std::string>& productFamily,
-                                   platform::FileDescriptor socket)
+                                   std::unique_ptr<platform::DatagramSocket> socket)
     : TallyBackend(platform, name, profile, productFamily),
       _sender(std::make_shared<DatagramSender>(platform.log, platform.queues, std::move(socket), _account)) {}
 

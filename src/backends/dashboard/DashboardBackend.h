@@ -10,7 +10,7 @@
 #include "backends/TallyBackend.h"
 
 namespace tallyd::platform {
-class FileDescriptor;
+class DatagramSocket;
 struct HTTPResult;
 }  // namespace tallyd::platform
 
@@ -59,7 +59,8 @@ class DashboardBackend final : public TallyBackend {
 
  private:
   DashboardBackend(const platform::Platform& platform, std::string_view name, const Payload& profile,
-                   const std::optional<std::string>& productFamily, platform::FileDescriptor socket);
+                   const std::optional<std::string>& productFamily,
+                   std::unique_ptr<platform::DatagramSocket> socket);
 
   [[nodiscard]] bool startWithProfile();
   [[nodiscard]] bool startWithServer(const std::optional<std::string>& serverIP, std::uint16_t serverPort);

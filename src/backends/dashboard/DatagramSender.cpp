@@ -1,10 +1,8 @@
 #include "backends/dashboard/DatagramSender.h"
 
 #include <arpa/inet.h>
-#include <sys/socket.h>
 
 #include <array>
-#include <cerrno>
 #include <exception>
 
 #include "platform/Log.h"
@@ -27,8 +25,6 @@ std::unique_ptr<Source> sourceOrNothing(Make&& make) {
   }
 }
 
-const sockaddr* generic(const sockaddr_in& address) { return reinterpret_cast<const sockaddr*>(&address); }
-
 std::string addressText(const sockaddr_in& address) {
   std::array<char, INET_ADDRSTRLEN> text{};
   ::inet_ntop(AF_INET, &address.sin_addr, text.data(), text.size());
@@ -46,7 +42,8 @@ std::string hexadecimal(std::string_view bytes) {
 
 }  // namespace
 
-DatagramSender::DatagramSender(platform::Log& log, platform::Queues& queues, platform::FileDescriptor socket,
+DatagramSender::DatagramSender(platform::Log& log, platform::Queues& queues,
+                               std::unique_ptr<platform::DatagramSocket> socket,
                                std::shared_ptr<Account> account)
     : _log(log),
       _networkProcQueue(queues.makeSerialQueue("com.quillon.Tally.networkProc")),
@@ -57,24 +54,22 @@ DatagramSender::DatagramSender(platform::Log& log, platform::Queues& queues, pla
 DatagramSender::~DatagramSender() { _messageQueue.drop(DropReason::CleanUp); }
 
 void DatagramSender::useReliableUDP() {
-  sockaddr_in anyPort{};
-  anyPort.sin_family = AF_INET;
-  anyPort.sin_addr.s_addr = htonl(INADDR_ANY);
-  if (::bind(_socket.get(), generic(anyPort), sizeof anyPort) != 0) {
-    asl_log(_log, LogLevel::Error, "Tally (DashboardBackend): can't bind socket, {:d}", errno);
+  if (const int error = _socket->bindToAnyPort()) {
+    asl_log(_log, LogLevel::Error, "Tally (DashboardBackend): can't bind socket, {:d}", error);
     return;
   }
   _delivery = Delivery::Reliable;
   _readSource = sourceOrNothing([self = shared_from_this()] {
     return self->_networkProcQueue->makeReadSource(
-        self->_socket.get(), [self] { self->processSocketRead(); }, [self] { self->_socket.reset(); });
+        self->_socket->descriptor(), [self] { self->processSocketRead(); },
+        [self] { self->_socket.reset(); });
   });
   if (!_readSource) asl_log(_log, LogLevel::Error, "Tally (setReliable): can't create read source");
 }
 
 bool DatagramSender::start(const sockaddr_in& server, Milliseconds period) {
   _server = server;
-  if (::connect(_socket.get(), generic(server), sizeof server) != 0) {
+  if (_socket->connect(server) != 0) {
     asl_log(_log, LogLevel::Error, "Tally (DashboardBackend): initWitName socket connect failed.");
     _readSource.reset();
     return false;
@@ -140,8 +135,7 @@ void DatagramSender::tryToSendMsg(const Datagram& datagram) {
 }
 
 bool DatagramSender::sendAllBytes(std::string_view bytes) const {
-  const ssize_t sent = ::send(_socket.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
-  if (sent != static_cast<ssize_t>(bytes.size())) return false;
+  if (!_socket || !_socket->send(bytes)) return false;
   showOnTap(bytes);
   return true;
 }
@@ -181,9 +175,9 @@ void DatagramSender::advanceDrop() {
 
 void DatagramSender::processSocketRead() {
   std::array<char, kDatagramBufferBytes> received{};
-  const ssize_t length = ::recvfrom(_socket.get(), received.data(), received.size(), 0, nullptr, nullptr);
-  if (length < 1) return;
-  const auto eventID = acknowledgedEventID({received.data(), static_cast<std::size_t>(length)});
+  const std::size_t length = _socket ? _socket->receive(received) : 0;
+  if (length == 0) return;
+  const auto eventID = acknowledgedEventID({received.data(), length});
   if (eventID) _messageQueue.acknowledge(*eventID);
 }
 

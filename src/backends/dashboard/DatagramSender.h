@@ -11,7 +11,7 @@
 
 #include "backends/dashboard/Datagram.h"
 #include "backends/dashboard/MessageQueue.h"
-#include "platform/FileDescriptor.h"
+#include "platform/DatagramSocket.h"
 #include "platform/SerialQueue.h"
 
 namespace tallyd::platform {
@@ -42,8 +42,9 @@ class DatagramSender : public std::enable_shared_from_this<DatagramSender> {
   /// What datagrams get after a drop: as many ticks as one needs that is sent on the first of them.
   static constexpr int kTicksAfterDrop = 21;
 
-  /// Borrows the log, which must outlive the queue's work. The socket must not block.
-  DatagramSender(platform::Log& log, platform::Queues& queues, platform::FileDescriptor socket,
+  /// Borrows the log, which must outlive the queue's work.
+  DatagramSender(platform::Log& log, platform::Queues& queues,
+                 std::unique_ptr<platform::DatagramSocket> socket,
                  std::shared_ptr<Account> account = std::make_shared<Account>());
   /// Books what still waits as dropped.
   ~DatagramSender();
@@ -79,7 +80,7 @@ class DatagramSender : public std::enable_shared_from_this<DatagramSender> {
 
   platform::Log& _log;
   const std::shared_ptr<platform::SerialQueue> _networkProcQueue;
-  platform::FileDescriptor _socket;
+  std::unique_ptr<platform::DatagramSocket> _socket;
   Delivery _delivery = Delivery::FireAndForget;
   bool _isStarted = false;
   sockaddr_in _server{};

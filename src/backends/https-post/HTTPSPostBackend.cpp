@@ -1,5 +1,7 @@
 #include "backends/https-post/HTTPSPostBackend.h"
 
+#include <new>
+
 #include "backends/RequestBooking.h"
 #include "backends/https-post/EventRecord.h"
 #include "backends/https-post/PostBody.h"
@@ -13,7 +15,6 @@
 #include "platform/SerialQueue.h"
 #include "platform/Settings.h"
 #include "storebag/StorebagEnvironment.h"
-#include "support/Consent.h"
 #include "support/GzipCompression.h"
 
 namespace tallyd {
@@ -91,6 +92,11 @@ TallyBackend::Result HTTPSPostBackend::sendMessage(const Payload& payload, const
           _requireUserInfo);
   if (_state == ReportingStatePending || _batchEvents || !hasRequiredUserInfo()) {
     batchEvent(std::move(event), numbers);
+    return std::nullopt;
+  }
+  if (isConsentWithdrawn()) {
+    logWithdrawal(1);
+    _account->dropNew(DropReason::ConsentWithdrawn, 1, numbers);
     return std::nullopt;
   }
   Events events{std::move(event)};
@@ -250,9 +256,26 @@ void HTTPSPostBackend::batchEvent(Dictionary event, const MessageNumbers& number
   ++count;
 }
 
+bool HTTPSPostBackend::isConsentWithdrawn() {
+  if (_consentChecks == ConsentChecks::BeforeEachPost && _dnuEnabled && !_isConsentWithdrawn) {
+    _isConsentWithdrawn = !DiagnosticLogSubmissionEnabled(_platform);
+  }
+  return _isConsentWithdrawn;
+}
+
+void HTTPSPostBackend::logWithdrawal(std::size_t events) const {
+  asl_log(_platform.log, LogLevel::Info,
+          "Tally(HTTPSPostBackend): consent has been withdrawn, not posting {} events", events);
+}
+
 std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::takeBatchForPost() {
   Events events = std::move(*_batchedEvents);
   _batchedEvents.reset();
+  if (isConsentWithdrawn()) {
+    logWithdrawal(events.size());
+    _account->dropHeld(DropReason::ConsentWithdrawn, events.size());
+    return std::nullopt;
+  }
   _account->startHeld(events.size());
   prepareEventArrayForMessage(events);
   return createMessageForPost(std::move(events));
@@ -266,6 +289,22 @@ void HTTPSPostBackend::prepareEventArrayForMessage(Events& events) const {
 }
 
 std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::createMessageForPost(Events events) const {
+  const std::size_t count = events.size();
+  try {
+    return documentOf(std::move(events));
+  } catch (const std::bad_alloc&) {
+    dropForMemory(count);
+    return std::nullopt;
+  }
+}
+
+void HTTPSPostBackend::dropForMemory(std::size_t events) const {
+  asl_log(_platform.log, LogLevel::Error, "Tally(HTTPSPostBackend): out of memory for a post of {} events",
+          events);
+  _account->drop(DropReason::OutOfMemory, events);
+}
+
+std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::documentOf(Events events) const {
   const timeval now = _platform.clock.timeOfDay();
   for (Dictionary& event : events) sanitizeEventForJSON(event, _platform.log);
   auto clientIdentifier = Tally(_platform).getPersistentIdentifierForDNU(_dnuType == DNUTypeConsent);
@@ -280,7 +319,20 @@ std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::createMessageForPost
 }
 
 TallyBackend::Result HTTPSPostBackend::postJsonMessage(const Document& document) const {
-  const std::string& json = document.json;
+  platform::HTTPRequest request;
+  platform::HTTPClient::Completion completion;
+  try {
+    request = requestFor(document.json);
+    completion = completionFor(document, request);
+  } catch (const std::bad_alloc&) {
+    dropForMemory(document.events);
+    return std::nullopt;
+  }
+  _platform.http.sendAsynchronousRequest(std::move(request), _queue, std::move(completion));
+  return _dnuType == DNUTypeConsent && _dnuEnabled ? Result(document.json) : std::nullopt;
+}
+
+platform::HTTPRequest HTTPSPostBackend::requestFor(const std::string& json) const {
   auto compressed = gzipDeflate(json, _platform.log);
   platform::HTTPRequest request;
   request.url = _postURL.value_or("");
@@ -298,9 +350,7 @@ TallyBackend::Result HTTPSPostBackend::postJsonMessage(const Document& document)
   request.body = platform::Data(plain ? json : std::move(*compressed));
   request.headers.emplace_back("Content-Length", std::to_string(request.body.size()));
   if (!plain) request.headers.emplace_back("Content-Encoding", "gzip");
-  auto completion = completionFor(document, request);
-  _platform.http.sendAsynchronousRequest(std::move(request), _queue, std::move(completion));
-  return _dnuType == DNUTypeConsent && _dnuEnabled ? Result(json) : std::nullopt;
+  return request;
 }
 
 platform::HTTPClient::Completion HTTPSPostBackend::completionFor(const Document& document,

@@ -12,6 +12,7 @@
 #include "backends/https-post/EventRecord.h"
 #include "backends/https-post/ReportingRules.h"
 #include "platform/HTTPClient.h"
+#include "support/Consent.h"
 
 namespace tallyd::platform {
 class SerialQueue;
@@ -23,7 +24,11 @@ namespace tallyd {
 /// in a batch while it may not be posted yet or batching is asked for.
 ///
 /// A batch holds at most threshold + 1 events of one method. Posts go to the shared transfer engine and are
-/// not retried; what becomes of them is only logged.
+/// not retried here; what becomes of them is only logged.
+///
+/// Consent is read when the backend is made. With recheckConsent() it is read again before each post: when it
+/// was there at first and has gone, this and all later posts are dropped. It never makes anything leave that
+/// would not have left without it.
 ///
 /// Books: events. Those of a batch are held; those of a post are in flight until it is done, and then sent
 /// when there was a response, with whatever status. Threading: the session's queue; the posts' completions
@@ -40,6 +45,7 @@ class HTTPSPostBackend final : public TallyBackend {
   ~HTTPSPostBackend() override;
 
   [[nodiscard]] std::string_view kind() const override { return "https-post"; }
+  void recheckConsent() override { _consentChecks = ConsentChecks::BeforeEachPost; }
   using TallyBackend::sendMessage;
   /// The posted document when the user consents to see it; nothing when nothing was posted.
   Result sendMessage(const Payload& payload, const timeval& timestamp, std::uint16_t method,
@@ -78,12 +84,18 @@ class HTTPSPostBackend final : public TallyBackend {
                                         std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID);
   void batchEvent(Dictionary event, const MessageNumbers& numbers);
   [[nodiscard]] bool hasRequiredUserInfo() const { return !_requireUserInfo || _userInfoDict; }
-  /// Prepares and takes the batch away; what is left is no batch.
+  [[nodiscard]] bool isConsentWithdrawn();
+  void logWithdrawal(std::size_t events) const;
+  /// Prepares and takes the batch away; what is left is no batch. Nothing without a document, and when
+  /// consent is withdrawn.
   std::optional<Document> takeBatchForPost();
   void prepareEventArrayForMessage(Events& events) const;
   /// Takes events that are booked as being in flight.
   std::optional<Document> createMessageForPost(Events events) const;
+  [[nodiscard]] std::optional<Document> documentOf(Events events) const;
+  void dropForMemory(std::size_t events) const;  ///< Of those in flight.
   Result postJsonMessage(const Document& document) const;
+  [[nodiscard]] platform::HTTPRequest requestFor(const std::string& json) const;
   /// What is to happen once the post is done; shows the post on the tap.
   platform::HTTPClient::Completion completionFor(const Document& document,
                                                  const platform::HTTPRequest& request) const;
@@ -94,6 +106,8 @@ class HTTPSPostBackend final : public TallyBackend {
   EventRecords _records;
   EventFilters _filters;
   const bool _dnuEnabled;
+  ConsentChecks _consentChecks = ConsentChecks::AtStart;
+  bool _isConsentWithdrawn = false;  ///< Seen to be, once.
   DNUType _dnuType = DNUTypeConsent;
   std::int32_t _eventThreshold = kDefaultEventThreshold;
   std::int32_t _extrasOnInternal = 0;

@@ -29,10 +29,12 @@ class CurlHTTPClient::Implementation {
     CurlTransfer transfer(_handles.take(), request, CurlTransfer::ResponseBody::Keep, _environment);
     if (const auto problem = transfer.prepare()) {
       _handles.giveBack(transfer.releaseHandle());
-      return failedRequest(request, *problem);
+      return failedRequest(request, *problem, HTTPFailure::Permanent);
     }
     const auto blocking = _queues.blockingCall();
-    HTTPResult result = transfer.result(curl_easy_perform(transfer.handle()));
+    CURLcode code = curl_easy_perform(transfer.handle());
+    if (transfer.prepareSecondAttempt(code)) code = curl_easy_perform(transfer.handle());
+    HTTPResult result = transfer.result(code);
     _handles.giveBack(transfer.releaseHandle());
     return result;
   }

@@ -49,6 +49,19 @@ bool sameName(std::string_view left, std::string_view right) {
   return left.size() == right.size() && strncasecmp(left.data(), right.data(), left.size()) == 0;
 }
 
+/// What no further attempt mends. Names that can't be looked up and certificates that do not hold are not
+/// among them: networks and servers get into order.
+bool isPermanent(CURLcode code) {
+  switch (code) {
+    case CURLE_UNSUPPORTED_PROTOCOL:
+    case CURLE_URL_MALFORMAT:
+    case CURLE_TOO_MANY_REDIRECTS:
+      return true;
+    default:
+      return false;
+  }
+}
+
 /// A header as libcurl's list takes it; there, an empty value is written with a semicolon.
 std::string headerLine(const std::string& name, std::string value) {
   std::replace_if(
@@ -69,8 +82,9 @@ std::string urlForMessages(const std::string& url) {
   return urlPart(parsed.get(), CURLUPART_URL);
 }
 
-HTTPResult failedRequest(const HTTPRequest& request, const std::string& reason) {
+HTTPResult failedRequest(const HTTPRequest& request, const std::string& reason, HTTPFailure kind) {
   HTTPResult result;
+  result.failure = kind;
   result.error = fmt::format("{} ({})", reason, urlForMessages(request.url));
   return result;
 }
@@ -205,19 +219,36 @@ void CurlTransfer::setCallbacks(Options& options) {
   options.set(CURLOPT_PREREQDATA, static_cast<void*>(this));
 }
 
+/// libcurl itself runs a request again when it finds the connection dead before it sends or while it
+/// receives, and not when it finds that while it sends a body.
+bool CurlTransfer::prepareSecondAttempt(CURLcode code) {
+  long newConnections = 0;
+  long status = 0;
+  curl_easy_getinfo(_handle.get(), CURLINFO_NUM_CONNECTS, &newConnections);
+  curl_easy_getinfo(_handle.get(), CURLINFO_RESPONSE_CODE, &status);
+  if (code != CURLE_SEND_ERROR || newConnections != 0 || status != 0 || _secondAttempt) return false;
+  _secondAttempt = true;
+  _error.front() = '\0';
+  return curl_easy_setopt(_handle.get(), CURLOPT_FRESH_CONNECT, 1L) == CURLE_OK;
+}
+
 HTTPResult CurlTransfer::result(CURLcode code) {
-  if (_tooLarge) {
-    return failedRequest(
-        _request, fmt::format("response of more than {} bytes", _environment.limits.maximumResponseBytes));
-  }
-  if (code != CURLE_OK) {
-    return failedRequest(_request,
-                         _error.front() != '\0' ? std::string(_error.data()) : curl_easy_strerror(code));
-  }
+  if (_tooLarge || code != CURLE_OK) return failure(code);
   HTTPResult result;
   result.response = response();
   result.data = Data(std::move(_body));
   return result;
+}
+
+HTTPResult CurlTransfer::failure(CURLcode code) const {
+  if (_tooLarge) {
+    return failedRequest(
+        _request, fmt::format("response of more than {} bytes", _environment.limits.maximumResponseBytes),
+        HTTPFailure::Permanent);
+  }
+  return failedRequest(_request,
+                       _error.front() != '\0' ? std::string(_error.data()) : curl_easy_strerror(code),
+                       isPermanent(code) ? HTTPFailure::Permanent : HTTPFailure::Transfer);
 }
 
 HTTPResponse CurlTransfer::response() const {

@@ -25,12 +25,14 @@ struct CurlEnvironment {
 [[nodiscard]] std::string urlForMessages(const std::string& url);
 
 /// An error about `request` that no transfer came to.
-[[nodiscard]] HTTPResult failedRequest(const HTTPRequest& request, const std::string& reason);
+[[nodiscard]] HTTPResult failedRequest(const HTTPRequest& request, const std::string& reason,
+                                       HTTPFailure kind = HTTPFailure::Transfer);
 
 /// Sets a handle up for a request, receives the response, and says what became of it.
 ///
-/// Life cycle: prepare(), then the handle is run by curl_easy_perform or a multi handle, then result(). It
-/// stays where it is from prepare() on: the handle points to it.
+/// Life cycle: prepare(), then the handle is run by curl_easy_perform or a multi handle, once more when
+/// prepareSecondAttempt() says so, then result(). It stays where it is from prepare() on: the handle points
+/// to it.
 ///
 /// Threading: one thread at a time.
 class CurlTransfer {
@@ -50,6 +52,10 @@ class CurlTransfer {
   /// Whether a connection was found and the request is on its way.
   [[nodiscard]] bool hasStarted() const { return _started; }
 
+  /// After the handle has been run: whether the request is to be run once more, on a connection of its own,
+  /// because the one that it had waited idle and was closed by the server as the request came. Such a request
+  /// has not been served (RFC 9112, section 9.3.1).
+  [[nodiscard]] bool prepareSecondAttempt(CURLcode code);
   [[nodiscard]] HTTPResult result(CURLcode code);
   /// The handle back, for another use; last.
   [[nodiscard]] CurlEasy releaseHandle() { return std::move(_handle); }
@@ -62,6 +68,7 @@ class CurlTransfer {
   void setConnection(Options& options);
   void setTimes(Options& options);
   void setCallbacks(Options& options);
+  [[nodiscard]] HTTPResult failure(CURLcode code) const;
   [[nodiscard]] HTTPResponse response() const;
   [[nodiscard]] bool received(const char* bytes, std::size_t size, ResponseBody use);
 
@@ -80,6 +87,7 @@ class CurlTransfer {
   std::size_t _receivedBytes = 0;
   bool _tooLarge = false;
   bool _started = false;
+  bool _secondAttempt = false;
 };
 
 }  // namespace tallyd::platform

@@ -7,6 +7,8 @@
 #include <iterator>
 #include <utility>
 
+#include "platform/http/RequestBytes.h"
+
 namespace tallyd::platform {
 
 namespace {
@@ -18,23 +20,15 @@ constexpr std::chrono::milliseconds kExpiryPeriod{1000};
 /// With nothing to do the thread only waits to be woken; the figure bounds nothing.
 constexpr int kIdlePollMs = 3'600'000;
 
-/// What a waiting request costs beside its texts: the records that hold it, and what the allocator adds.
-constexpr std::size_t kBookkeepingBytes = 512;
-
-std::size_t heldBytesOf(const HTTPRequest& request) {
-  std::size_t bytes = kBookkeepingBytes + request.body.size() + request.url.size();
-  for (const auto& [name, value] : request.headers) bytes += name.size() + value.size();
-  return bytes;
-}
-
 }  // namespace
 
 TransferEngine::Inbox::Answer TransferEngine::Inbox::add(WaitingRequest& request) {
   const std::lock_guard lock(_mutex);
   if (_closed) return Answer::Closed;
   if (request.client.heldBytes > _maximumBytes - _heldBytes) return Answer::Full;
-  _heldBytes += request.client.heldBytes;
+  const std::size_t heldBytes = request.client.heldBytes;
   _requests.push_back(std::move(request));
+  _heldBytes += heldBytes;
   return _requests.size() == 1 ? Answer::TakenAsFirst : Answer::Taken;
 }
 
@@ -154,7 +148,7 @@ void TransferEngine::start(WaitingRequest request) {
   std::optional<std::string> problem = transfer->prepare();
   if (!problem && curl_multi_add_handle(_multi.get(), handle) != CURLM_OK) problem = "out of memory";
   if (problem) {
-    HTTPResult result = failedRequest(transfer->request(), *problem);
+    HTTPResult result = failedRequest(transfer->request(), *problem, HTTPFailure::Permanent);
     _pool.giveBack(transfer->releaseHandle());
     tell(std::move(request.client), std::move(result));
     return;
@@ -167,24 +161,14 @@ void TransferEngine::finishDone() {
   while (const CURLMsg* message = curl_multi_info_read(_multi.get(), &left)) {
     if (message->msg != CURLMSG_DONE) continue;
     const CURLcode code = message->data.result;
-    if (sendAgainOnFreshConnection(message->easy_handle, code)) continue;
+    if (sendAgain(message->easy_handle, code)) continue;
     finish(message->easy_handle, [code](CurlTransfer& transfer) { return transfer.result(code); });
   }
 }
 
-/// A server that closed an idle connection over TLS leaves a connection that libcurl takes for alive, and a
-/// body that can't be sent on it is no reason to lose the request: nobody has received it (RFC 9112,
-/// section 9.3.1).
-bool TransferEngine::sendAgainOnFreshConnection(CURL* handle, CURLcode code) {
-  long newConnections = 0;
-  long status = 0;
-  curl_easy_getinfo(handle, CURLINFO_NUM_CONNECTS, &newConnections);
-  curl_easy_getinfo(handle, CURLINFO_RESPONSE_CODE, &status);
-  ActiveTransfer& active = _active.at(handle);
-  if (code != CURLE_SEND_ERROR || newConnections != 0 || status != 0 || active.sentAgain) return false;
-  active.sentAgain = true;
+bool TransferEngine::sendAgain(CURL* handle, CURLcode code) {
+  if (!_active.at(handle).transfer->prepareSecondAttempt(code)) return false;
   curl_multi_remove_handle(_multi.get(), handle);
-  curl_easy_setopt(handle, CURLOPT_FRESH_CONNECT, 1L);
   return curl_multi_add_handle(_multi.get(), handle) == CURLM_OK;
 }
 

@@ -50,7 +50,6 @@ class TransferEngine {
   struct ActiveTransfer {
     std::unique_ptr<CurlTransfer> transfer;
     Client client;
-    bool sentAgain = false;  ///< On a connection of its own, after one that was idle proved dead.
   };
 
   /// What submitters and the thread share.
@@ -79,7 +78,7 @@ class TransferEngine {
   void startWaiting();
   void start(WaitingRequest request);
   void finishDone();
-  bool sendAgainOnFreshConnection(CURL* handle, CURLcode code);
+  [[nodiscard]] bool sendAgain(CURL* handle, CURLcode code);
   void expireLate();
   void finish(CURL* handle, const std::function<HTTPResult(CurlTransfer&)>& result);
   void failUnfinished(const std::string& reason);

@@ -97,10 +97,12 @@ void DBusClientConnection::submit(Waiting call) {
     return;
   }
   _waiting.push_back(std::move(call));
-  if (isReady()) wake();
+  sendWaiting();
 }
 
-bool DBusClientConnection::isReady() const { return isAuthenticated() && !isClogged(); }
+bool DBusClientConnection::isReady() const {
+  return _waiting.empty() && isAuthenticated() && !isClogged() && !peerHasClosed();
+}
 
 void DBusClientConnection::callNow(Request request, std::chrono::milliseconds timeout,
                                    Completion completion) {
@@ -109,7 +111,7 @@ void DBusClientConnection::callNow(Request request, std::chrono::milliseconds ti
 
 bool DBusClientConnection::sendWaiting() {
   bool sent = false;
-  while (!_waiting.empty() && isReady()) {
+  while (!_waiting.empty() && isAuthenticated() && !isClogged()) {
     auto call = std::move(_waiting.front());
     _waiting.pop_front();
     send(std::move(call));

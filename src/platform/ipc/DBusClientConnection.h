@@ -77,6 +77,7 @@ class DBusClientConnection final : public DBusConnection {
   /// `ready` runs whenever a call would leave at once, first when authentication is over; it returns whether
   /// it made one. `ended` runs last, also after finish() and abort(). Before the start.
   void setOwner(std::function<bool()> ready, std::function<void(bool withinMessage)> ended);
+  /// Whether a call would leave now, to a service that has not closed its side yet.
   [[nodiscard]] bool isReady() const;
   void callNow(Request request, std::chrono::milliseconds timeout, Completion completion);
   void finish();  ///< As close(), without waiting for it.

@@ -1,11 +1,13 @@
 #include "platform/ipc/DBusConnection.h"
 
+#include <poll.h>
 #include <sys/socket.h>
 
 #include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstring>
+#include <new>
 #include <utility>
 
 #include "platform/dbus/Authentication.h"
@@ -86,10 +88,18 @@ void DBusConnection::end(End end) {
   _readSource.reset();
   _writeSource.reset();
   _authenticationTimer.reset();
+  _endTimer.reset();
   _socket.reset();
   _descriptors.clear();
   dropOutput();
   ended(end);
+}
+
+void DBusConnection::endAfterInput() {
+  if (!_isStarted) return end(End::BetweenMessages);
+  if (!isOpen() || _endTimer) return;
+  ::shutdown(_socket.get(), SHUT_RD);
+  _endTimer = _queue->makeTimer(kPatienceAtEnd, kPatienceAtEnd, turn(&DBusConnection::endUnlessReading));
 }
 
 std::uint32_t DBusConnection::nextSerial() {
@@ -117,6 +127,11 @@ std::optional<std::string> DBusConnection::write(dbus::MessageFields fields, con
 
 void DBusConnection::wake() {
   if (_isStarted && isOpen() && !_isTakingTurn) finishTurn();
+}
+
+bool DBusConnection::peerHasClosed() const {
+  pollfd closed{.fd = _socket.get(), .events = POLLRDHUP, .revents = 0};
+  return ::poll(&closed, 1, 0) > 0;
 }
 
 bool DBusConnection::isClogged() const {
@@ -187,6 +202,9 @@ void DBusConnection::take(std::string_view fresh) {
     }
   } catch (const dbus::Malformed&) {
     end(End::WithinMessage);
+  } catch (const std::bad_alloc&) {
+    // A message that is too large for what memory is left costs its sender the connection, and nobody else.
+    end(End::WithinMessage);
   }
 }
 
@@ -235,6 +253,11 @@ void DBusConnection::takeMessage(std::string_view bytes) {
 void DBusConnection::inputEnded() {
   if (!_authentication && !_input.empty()) return end(End::WithinMessage);
   _inputHasEnded = true;
+}
+
+/// While something is still read, or about to be, the end comes by itself.
+void DBusConnection::endUnlessReading() {
+  if (_inputHasEnded || isClogged()) end(End::BetweenMessages);
 }
 
 void DBusConnection::flush() {

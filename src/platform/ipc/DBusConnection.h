@@ -36,6 +36,7 @@ class DBusConnection : public std::enable_shared_from_this<DBusConnection> {
   static constexpr std::size_t kMaximumQueuedBytes = 4 * 1024 * 1024;
   static constexpr std::size_t kMaximumDescriptors = 256;
   static constexpr std::chrono::seconds kAuthenticationTime{90};
+  static constexpr std::chrono::seconds kPatienceAtEnd{1};
 
   DBusConnection(const DBusConnection&) = delete;
   DBusConnection& operator=(const DBusConnection&) = delete;
@@ -54,6 +55,9 @@ class DBusConnection : public std::enable_shared_from_this<DBusConnection> {
   void start(std::unique_ptr<dbus::Authentication> authentication);
   /// Closes at once; what is queued is dropped. ended() is called unless it was before.
   void end(End end);
+  /// Takes what has arrived by now, then ends as if the peer had closed. When something hinders that because
+  /// the peer does not read, it ends after kPatienceAtEnd.
+  void endAfterInput();
 
   /// A serial number that no other message of this side has.
   [[nodiscard]] std::uint32_t nextSerial();
@@ -78,6 +82,8 @@ class DBusConnection : public std::enable_shared_from_this<DBusConnection> {
   [[nodiscard]] bool isOpen() const { return static_cast<bool>(_socket); }
   [[nodiscard]] bool isAuthenticated() const { return _isStarted && !_authentication && isOpen(); }
   [[nodiscard]] bool hasOutput() const { return _sentBytes < _output.size(); }
+  /// The peer has closed its side; what it sent before may still wait to be read.
+  [[nodiscard]] bool peerHasClosed() const;
   /// Too much waits for the peer.
   [[nodiscard]] bool isClogged() const;
   [[nodiscard]] const std::shared_ptr<SerialQueue>& queue() const { return _queue; }
@@ -101,6 +107,7 @@ class DBusConnection : public std::enable_shared_from_this<DBusConnection> {
   bool takeAuthentication(std::string_view bytes, std::size_t& taken);
   void takeMessage(std::string_view bytes);
   void inputEnded();
+  void endUnlessReading();
   void flush();
   void forgetSent();
   void dropOutput();
@@ -111,6 +118,7 @@ class DBusConnection : public std::enable_shared_from_this<DBusConnection> {
   std::unique_ptr<Source> _readSource;
   std::unique_ptr<Source> _writeSource;
   std::unique_ptr<Source> _authenticationTimer;
+  std::unique_ptr<Source> _endTimer;  ///< From endAfterInput() on.
   std::unique_ptr<dbus::Authentication> _authentication;  ///< Until it is over.
   bool _isStarted = false;
   bool _hasEnded = false;

@@ -23,8 +23,8 @@ constexpr std::chrono::milliseconds kPauseWithoutResources{250};
 
 class DBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
  public:
-  Acceptor(const std::filesystem::path& socketPath, Queues& queues, Log& log, SocketAccess access)
-      : _socket(socketPath, access),
+  Acceptor(std::unique_ptr<const ListeningSocket> socket, Queues& queues, Log& log)
+      : _socket(std::move(socket)),
         _log(log),
         _queue(queues.makeSerialQueue("com.quillon.tallyd.listener")),
         _queues(queues) {}
@@ -35,7 +35,7 @@ class DBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
     const std::lock_guard lock(_mutex);
     if (_stopped || _source) return;
     _source =
-        _queue->makeReadSource(_socket.descriptor(), [self = shared_from_this()] { self->acceptSome(); });
+        _queue->makeReadSource(_socket->descriptor(), [self = shared_from_this()] { self->acceptSome(); });
   }
 
   void stop() {
@@ -48,7 +48,7 @@ class DBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
   void acceptSome() {
     const std::lock_guard lock(_mutex);
     for (int i = 0; i < kAcceptsPerTurn && !_stopped; ++i) {
-      FileDescriptor client(::accept4(_socket.descriptor(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+      FileDescriptor client(::accept4(_socket->descriptor(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
       if (!client && !mayGoOn(errno)) return;
       if (client) welcome(std::move(client));
     }
@@ -73,7 +73,7 @@ class DBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
     return false;
   }
 
-  const ListeningSocket _socket;
+  const std::unique_ptr<const ListeningSocket> _socket;
   Log& _log;
   const std::shared_ptr<SerialQueue> _queue;
   Queues& _queues;
@@ -88,7 +88,10 @@ class DBusListener::Acceptor : public std::enable_shared_from_this<Acceptor> {
 
 DBusListener::DBusListener(const std::filesystem::path& socketPath, Queues& queues, Log& log,
                            SocketAccess access)
-    : _acceptor(std::make_shared<Acceptor>(socketPath, queues, log, access)) {}
+    : DBusListener(std::make_unique<const ListeningSocket>(socketPath, access), queues, log) {}
+
+DBusListener::DBusListener(std::unique_ptr<const ListeningSocket> socket, Queues& queues, Log& log)
+    : _acceptor(std::make_shared<Acceptor>(std::move(socket), queues, log)) {}
 
 DBusListener::~DBusListener() { _acceptor->stop(); }
 

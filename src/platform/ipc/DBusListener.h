@@ -23,6 +23,8 @@ class DBusListener final : public Listener {
   /// and log.
   DBusListener(const std::filesystem::path& socketPath, Queues& queues, Log& log,
                SocketAccess access = SocketAccess::Everybody);
+  /// With a socket that was taken earlier, as a process does that may not listen any more.
+  DBusListener(std::unique_ptr<const ListeningSocket> socket, Queues& queues, Log& log);
   ~DBusListener() override;
   DBusListener(const DBusListener&) = delete;
   DBusListener& operator=(const DBusListener&) = delete;

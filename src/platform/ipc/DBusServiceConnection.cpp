@@ -94,6 +94,10 @@ void DBusServiceConnection::resume() {
   });
 }
 
+void DBusServiceConnection::finish() {
+  queue()->async([self = shared_from_this(), this] { endAfterInput(); });
+}
+
 void DBusServiceConnection::incoming(const dbus::Message& message, std::vector<FileDescriptor> descriptors) {
   if (message.fields.type != dbus::MessageType::MethodCall) return;
   const CallRoute route = routeCall(message, _interface, _number);

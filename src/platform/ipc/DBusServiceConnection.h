@@ -35,6 +35,7 @@ class DBusServiceConnection final : public ServiceConnection, public DBusConnect
     _invalidationHandler = std::move(handler);
   }
   void resume() override;
+  void finish() override;
 
  private:
   class Call;

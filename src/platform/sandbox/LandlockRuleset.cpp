@@ -19,6 +19,12 @@
 #ifndef LANDLOCK_ACCESS_FS_IOCTL_DEV
 #define LANDLOCK_ACCESS_FS_IOCTL_DEV (1ULL << 15)
 #endif
+#ifndef LANDLOCK_ACCESS_NET_BIND_TCP
+#define LANDLOCK_ACCESS_NET_BIND_TCP (1ULL << 0)
+#endif
+#ifndef LANDLOCK_RESTRICT_SELF_LOG_SAME_EXEC_OFF
+#define LANDLOCK_RESTRICT_SELF_LOG_SAME_EXEC_OFF (1U << 0)
+#endif
 #ifndef LANDLOCK_SCOPE_ABSTRACT_UNIX_SOCKET
 #define LANDLOCK_SCOPE_ABSTRACT_UNIX_SOCKET (1ULL << 0)
 #endif
@@ -63,7 +69,7 @@ std::uint64_t rightsFor(LandlockRuleset::Access access) {
       return LANDLOCK_ACCESS_FS_READ_FILE | LANDLOCK_ACCESS_FS_READ_DIR;
     case LandlockRuleset::Access::Write:
       return LANDLOCK_ACCESS_FS_WRITE_FILE | LANDLOCK_ACCESS_FS_TRUNCATE | LANDLOCK_ACCESS_FS_MAKE_REG |
-             LANDLOCK_ACCESS_FS_MAKE_DIR | LANDLOCK_ACCESS_FS_MAKE_SOCK | LANDLOCK_ACCESS_FS_REFER;
+             LANDLOCK_ACCESS_FS_MAKE_DIR | LANDLOCK_ACCESS_FS_REFER;
     case LandlockRuleset::Access::Remove:
       break;
   }
@@ -77,12 +83,12 @@ std::uint64_t rightsFor(LandlockRuleset::Access access) {
 }  // namespace
 
 LandlockRuleset::LandlockRuleset() {
-  const long version =
-      ::syscall(SYS_landlock_create_ruleset, nullptr, std::size_t{0}, LANDLOCK_CREATE_RULESET_VERSION);
-  if (version < 1) fail("the kernel can't restrict the file system (Landlock)");
+  _version = ::syscall(SYS_landlock_create_ruleset, nullptr, std::size_t{0}, LANDLOCK_CREATE_RULESET_VERSION);
+  if (_version < 1) fail("the kernel can't restrict the file system (Landlock)");
   RulesetAttributes attributes;
-  attributes.handledFileAccess = _handled = rightsOfVersion(version);
-  if (version >= 6) attributes.scoped = LANDLOCK_SCOPE_ABSTRACT_UNIX_SOCKET | LANDLOCK_SCOPE_SIGNAL;
+  attributes.handledFileAccess = _handled = rightsOfVersion(_version);
+  if (_version >= 4) attributes.handledNetworkAccess = LANDLOCK_ACCESS_NET_BIND_TCP;
+  if (_version >= 6) attributes.scoped = LANDLOCK_SCOPE_ABSTRACT_UNIX_SOCKET | LANDLOCK_SCOPE_SIGNAL;
   _ruleset = FileDescriptor(static_cast<int>(
       ::syscall(SYS_landlock_create_ruleset, &attributes, sizeof attributes, std::uint32_t{0})));
   if (!_ruleset) fail("no Landlock ruleset could be made");
@@ -103,8 +109,10 @@ bool LandlockRuleset::allow(const std::filesystem::path& path, Access access) {
   return true;
 }
 
-void LandlockRuleset::enforce() const {
-  if (::syscall(SYS_landlock_restrict_self, _ruleset.get(), std::uint32_t{0}) != 0) {
+void LandlockRuleset::enforce(Refusals refusals) const {
+  const std::uint32_t flags =
+      refusals == Refusals::Quiet && _version >= 7 ? LANDLOCK_RESTRICT_SELF_LOG_SAME_EXEC_OFF : 0;
+  if (::syscall(SYS_landlock_restrict_self, _ruleset.get(), flags) != 0) {
     fail("the file system could not be restricted (Landlock)");
   }
 }

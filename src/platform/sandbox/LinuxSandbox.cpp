@@ -9,10 +9,12 @@
 #include <iterator>
 #include <system_error>
 
+#include "platform/sandbox/FileProbes.h"
 #include "platform/sandbox/LandlockRuleset.h"
 #include "platform/sandbox/SandboxErrors.h"
 #include "platform/sandbox/SandboxProfile.h"
 #include "platform/sandbox/SystemCallFilter.h"
+#include "platform/sandbox/SystemCallProbes.h"
 
 namespace tallyd::platform {
 namespace {
@@ -63,7 +65,10 @@ void LinuxSandbox::confine(const std::filesystem::path& profilePath) {
     }
   });
   attempt(profile, profilePath, _log, [&] { restrictFiles(profile); });
-  attempt(profile, profilePath, _log, [&] { filter.enforce(); });
+  attempt(profile, profilePath, _log, [&] {
+    filter.enforce();
+    _restrictsCalls = true;
+  });
 }
 
 void LinuxSandbox::restrictFiles(const SandboxProfile& profile) {
@@ -77,7 +82,19 @@ void LinuxSandbox::restrictFiles(const SandboxProfile& profile) {
   for (const auto& path : profile.read) rules.allow(path, LandlockRuleset::Access::Read);
   for (const auto& path : profile.write) rules.allow(path, LandlockRuleset::Access::Write);
   for (const auto& path : profile.remove) rules.allow(path, LandlockRuleset::Access::Remove);
-  rules.enforce();
+  // Enforced twice, so that the probes leave nothing in the system's audit, but later refusals do.
+  rules.enforce(LandlockRuleset::Refusals::Quiet);
+  _fileHoles = reachableFiles();
+  rules.enforce(LandlockRuleset::Refusals::Audited);
+}
+
+std::vector<std::string> LinuxSandbox::holes() const {
+  std::vector<std::string> holes = _fileHoles;
+  if (!_restrictsCalls) return holes;
+  for (const auto& [act, calls] : systemCallsLetThrough()) {
+    holes.push_back(fmt::format("{} ({})", act, fmt::join(calls, ", ")));
+  }
+  return holes;
 }
 
 std::unique_ptr<Sandbox::Grant> LinuxSandbox::offerGrant(std::string_view token,

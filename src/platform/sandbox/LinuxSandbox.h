@@ -22,6 +22,12 @@ class LinuxSandbox final : public Sandbox {
 
   [[nodiscard]] std::optional<std::string> sandbox_init(std::string_view profileName) override;
 
+  /// Tries what no confined process may do, whatever its profile says: what the process could do all the
+  /// same, as a text each. Parts that an optional profile went without are not tried.
+  ///
+  /// After sandbox_init(), and like it before any thread starts.
+  [[nodiscard]] std::vector<std::string> holes() const;
+
   [[nodiscard]] std::unique_ptr<Grant> offerGrant(std::string_view token,
                                                   std::vector<FileDescriptor> descriptors) override;
   ExtensionHandle sandbox_extension_consume(std::string_view token) override;
@@ -35,6 +41,8 @@ class LinuxSandbox final : public Sandbox {
   const Root& _root;
   Log& _log;
   FileGrants _grants;
+  std::vector<std::string> _fileHoles;  ///< Tried while the refusals are not audited.
+  bool _restrictsCalls = false;
 };
 
 }  // namespace tallyd::platform

@@ -115,7 +115,8 @@ TEST_F(TallyReconnectTest, ComesBackEveryTime) {
   TallyConnection connection(options());
   for (int i = 0; i < 5; ++i) {
     startDaemon();
-    EXPECT_EQ(connection.fetchDisplayURLSync().value, "text");
+    const auto reply = connection.fetchDisplayURLSync();
+    EXPECT_EQ(reply.value, "text") << reply.error.value_or("");
     _daemon.reset();
   }
 }

@@ -145,6 +145,16 @@ TEST(JSONTest, ReadsNestingUpToItsBoundOnly) {
   EXPECT_FALSE(valueFromJSON(objects).value);
 }
 
+TEST(JSONTest, ReadsTheLargestNumbersThatThereAre) {
+  for (const double largest : {std::numeric_limits<double>::max(), std::numeric_limits<double>::lowest()}) {
+    const auto text = jsonFromValue(Value(largest));
+    ASSERT_TRUE(text);
+    EXPECT_EQ(valueFromJSON(*text).value, Value(largest)) << *text;
+    EXPECT_EQ(valueFromJSON("[1," + *text + "]").value, (Value(Array{1, largest})));
+  }
+  EXPECT_FALSE(valueFromJSON("[1.7976931348623159e308]").value);
+}
+
 TEST(JSONTest, ReadsBackWhatItWrites) {
   const Value value =
       Dictionary{{"ключ", Array{1, -2.25, 1e300, "a\"b\\c\x01", true, Value(), Dictionary{{"", ""}}}}};

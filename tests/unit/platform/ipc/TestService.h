@@ -149,6 +149,10 @@ class TestService final : public ListenerDelegate {
 
   bool shouldAcceptNewConnection(const std::shared_ptr<ServiceConnection>& connection) override {
     if (refuse) return false;
+    {
+      const std::lock_guard lock(_mutex);
+      _connections.push_back(connection);
+    }
     connection->setExportedInterface(testInterface());
     connection->setExportedObject(std::make_shared<TestObject>(events));
     connection->setInterruptionHandler([this] { events.add("interrupted"); });
@@ -159,10 +163,19 @@ class TestService final : public ListenerDelegate {
     return true;
   }
 
+  void finishAll() {
+    const std::lock_guard lock(_mutex);
+    for (const auto& each : _connections) {
+      if (const auto connection = each.lock()) connection->finish();
+    }
+  }
+
   TestEvents events;
   bool refuse = false;
 
  private:
+  std::mutex _mutex;
+  std::vector<std::weak_ptr<ServiceConnection>> _connections;
   AsioQueues _queues{2};
   DBusListener _listener;
 };

@@ -8,6 +8,7 @@
 #include <sys/epoll.h>
 #include <sys/eventfd.h>
 #include <sys/mman.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/timerfd.h>
@@ -95,32 +96,43 @@ TEST_F(DaemonProfileTest, KeepsOtherFilesOutOfReach) {
             "EACCES EACCES EACCES EACCES EACCES");
 }
 
-TEST_F(DaemonProfileTest, ListensOnItsSocket) {
+TEST_F(DaemonProfileTest, AcceptsOnASocketThatItTookBefore) {
+  const auto place = path("run/tallyd/com.quillon.tallyd");
+  std::filesystem::create_directories(place.parent_path());
+  auto address = unixAddress(place);
+  const FileDescriptor listener(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  ASSERT_EQ(::bind(listener.get(), general(address), sizeof address), 0);
+  ASSERT_EQ(::listen(listener.get(), 5), 0);
+  const FileDescriptor client(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  ASSERT_EQ(::connect(client.get(), general(address), sizeof address), 0);
   EXPECT_EQ(confined([&] {
-              const auto place = path("run/tallyd/com.quillon.tallyd");
-              auto address = unixAddress(place);
-              const FileDescriptor listener(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-              const FileDescriptor client(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-              std::string seen =
-                  inTurn({outcome(::bind(listener.get(), general(address), sizeof address)),
-                          outcome(::chmod(place.c_str(), 0666)), outcome(::listen(listener.get(), 5)),
-                          outcome(::connect(client.get(), general(address), sizeof address))});
               const FileDescriptor accepted(::accept4(listener.get(), nullptr, nullptr, SOCK_CLOEXEC));
-              return inTurn({seen, outcome(accepted.get()), outcome(::unlink(place.c_str()))});
+              return inTurn({outcome(accepted.get()), outcome(::unlink(place.c_str()))});
             }),
-            "ok ok ok ok ok ok");
+            "ok ok");
+}
+
+TEST_F(DaemonProfileTest, ListensOnNoNewSocket) {
+  EXPECT_EQ(confined([&] {
+              auto unixPlace = unixAddress(path("run/tallyd/other"));
+              const FileDescriptor local(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+              const FileDescriptor network(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+              return inTurn({outcome(::bind(local.get(), general(unixPlace), sizeof unixPlace)),
+                             outcome(::listen(local.get(), 1)), outcome(::listen(network.get(), 1))});
+            }),
+            "EACCES EPERM EPERM");
 }
 
 TEST_F(DaemonProfileTest, SpeaksTCPAndUDP) {
-  EXPECT_EQ(confined([] {
-              auto address = loopback();
-              socklen_t length = sizeof address;
-              const FileDescriptor listener(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  auto server = loopback();
+  socklen_t length = sizeof server;
+  const FileDescriptor listener(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  ASSERT_EQ(::bind(listener.get(), general(server), sizeof server), 0);
+  ASSERT_EQ(::listen(listener.get(), 1), 0);
+  ASSERT_EQ(::getsockname(listener.get(), general(server), &length), 0);
+  EXPECT_EQ(confined([&] {
               const FileDescriptor client(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-              std::string seen = inTurn({outcome(::bind(listener.get(), general(address), sizeof address)),
-                                         outcome(::listen(listener.get(), 1)),
-                                         outcome(::getsockname(listener.get(), general(address), &length)),
-                                         outcome(::connect(client.get(), general(address), sizeof address)),
+              std::string seen = inTurn({outcome(::connect(client.get(), general(server), sizeof server)),
                                          outcome(::send(client.get(), "x", 1, MSG_NOSIGNAL))});
               auto any = loopback();
               const FileDescriptor datagrams(::socket(AF_INET, SOCK_DGRAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
@@ -130,7 +142,25 @@ TEST_F(DaemonProfileTest, SpeaksTCPAndUDP) {
                              outcome(::sendto(datagrams.get(), "y", 1, 0, general(any), sizeof any))});
               return seen;
             }),
-            "ok ok ok ok ok ok ok ok");
+            "ok ok ok ok ok");
+}
+
+TEST_F(DaemonProfileTest, AsksForItsLimitsAndChangesNone) {
+  EXPECT_EQ(confined([] {
+              rlimit limit{};
+              return inTurn(
+                  {outcome(::getrlimit(RLIMIT_NOFILE, &limit)), outcome(::setrlimit(RLIMIT_NOFILE, &limit))});
+            }),
+            "ok EPERM");
+}
+
+TEST_F(DaemonProfileTest, LeavesNoHoles) {
+  EXPECT_EQ(confined([&] {
+              std::string holes;
+              for (const auto& hole : _sandbox.holes()) holes += hole + "\n";
+              return holes;
+            }),
+            "");
 }
 
 TEST_F(DaemonProfileTest, LooksUpNames) {

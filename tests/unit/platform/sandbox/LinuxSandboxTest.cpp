@@ -65,9 +65,10 @@ class LinuxSandboxTest : public testing::Test {
   }
 
   /// The usual profile: one folder to read, one to work in.
-  void writeUsualProfile() {
+  void writeUsualProfile(std::string_view calls = kAllCalls) {
     writeProfile(arrayOf("Read", {"open", "/work", "single", "missing"}) +
-                 arrayOf("Write", {"work", "made/on/demand"}) + arrayOf("Remove", {"work"}));
+                     arrayOf("Write", {"work", "made/on/demand"}) + arrayOf("Remove", {"work"}),
+                 calls);
   }
 
   /// What `body` returns in a child that entered the sandbox.
@@ -115,7 +116,7 @@ TEST_F(LinuxSandboxTest, ReadsOnlyWhereTheProfileSays) {
 }
 
 TEST_F(LinuxSandboxTest, WritesOnlyWhereTheProfileSays) {
-  writeUsualProfile();
+  writeUsualProfile(std::string(kAllCalls) + "<string>truncate</string>");
   EXPECT_EQ(confined([&] {
               return inTurn({outcomeOfOpening(path("work/new"), O_WRONLY | O_CREAT),
                              outcomeOfOpening(path("work/file"), O_RDWR | O_TRUNC),
@@ -226,6 +227,8 @@ TEST_F(LinuxSandboxTest, OpensOrdinarySocketsOnly) {
   EXPECT_EQ(opened(AF_INET, SOCK_RAW, IPPROTO_ICMP), "EPERM");
   EXPECT_EQ(opened(AF_PACKET, SOCK_DGRAM, 0), "EPERM");
   EXPECT_EQ(opened(AF_VSOCK, SOCK_STREAM, 0), "EPERM");
+  EXPECT_EQ(opened(AF_INET, SOCK_STREAM, IPPROTO_SCTP), "EPERM");
+  EXPECT_EQ(opened(AF_INET, SOCK_DGRAM, IPPROTO_ICMP), "EPERM");
 }
 
 TEST_F(LinuxSandboxTest, SignalsOnlyItself) {
@@ -329,6 +332,30 @@ TEST_F(LinuxSandboxTest, AnOptionalProfileIsEnforcedWhereItCanBe) {
       }),
       "ok EPERM")
       << "files stay open where only Landlock is missing";
+}
+
+TEST_F(LinuxSandboxTest, NamesTheHolesThatAProfileLeaves) {
+  writeProfile(arrayOf("Read", {"system:/tmp"}) + arrayOf("Write", {"system:/dev/full"}),
+               std::string(kAllCalls) + "<string>ptrace</string><string>fork</string>");
+  const auto holes = confined([&] {
+    std::string lines;
+    for (const auto& hole : _sandbox.holes()) lines += hole + "\n";
+    return lines;
+  });
+  EXPECT_EQ(holes, "read /tmp\nwrite to /dev/full\nstart a process (fork)\ntrace a process (ptrace)\n");
+}
+
+TEST_F(LinuxSandboxTest, TriesNothingThatAnOptionalProfileWentWithout) {
+  writeProfile("<key>Optional</key><true/>");
+  const auto holesWithout = [&](const std::vector<const char*>& lacking) {
+    return inChild([&] {
+      pretendTheKernelLacks(lacking);
+      const auto error = _sandbox.sandbox_init("test");
+      return error ? *error : std::to_string(_sandbox.holes().size());
+    });
+  };
+  EXPECT_EQ(holesWithout({"landlock_create_ruleset"}), "0");
+  EXPECT_EQ(holesWithout({"seccomp"}), "0");
 }
 
 std::string contents(const FileDescriptor& file) {

@@ -38,6 +38,14 @@ TEST(ReadableTextTest, EscapesWhatATerminalWouldObey) {
   EXPECT_EQ(line.find('\n'), std::string::npos);
 }
 
+TEST(ReadableTextTest, EscapesTheControlsThatJSONLeavesAsTheyAre) {
+  EXPECT_EQ(readableText("a\x7f"), "\"a\\u007f\"");
+  EXPECT_EQ(readableText("\xC2\x9B"
+                         "2J"),
+            "\"\\u009b2J\"");
+  EXPECT_EQ(readableText("\xC2\xA9"), "\"\xC2\xA9\"");
+}
+
 TEST(ReadableTextTest, GivesJSONAFormForEveryValue) {
   const Dictionary record{{"at", Date{1772366401.25}},
                           {"bytes", Data("hi")},

@@ -1,0 +1,157 @@
+#include "platform/http/RetryingHTTPClient.h"
+
+#include <fmt/format.h>
+
+#include <mutex>
+#include <unordered_set>
+#include <utility>
+
+#include "platform/Clock.h"
+#include "platform/Log.h"
+#include "platform/Randomness.h"
+#include "platform/http/CurlTransfer.h"
+#include "platform/http/RequestBytes.h"
+
+namespace tallyd::platform {
+
+namespace {
+
+std::string reasonOf(const HTTPRequest& request, const HTTPResult& result) {
+  if (result.error) return *result.error;
+  return fmt::format("status {} ({})", result.response->status, urlForMessages(request.url));
+}
+
+/// The client below holds its own copy of all but the body, which is shared.
+std::size_t heldBytesWithCopy(const HTTPRequest& request) {
+  return 2 * heldBytesOf(request) - request.body.size();
+}
+
+}  // namespace
+
+/// All requests that have not been completed. What the queues still have to do holds it.
+class RetryingHTTPClient::Posts : public std::enable_shared_from_this<Posts> {
+ public:
+  Posts(HTTPClient& client, const Clock& clock, Randomness& randomness, Log& log, const RetryLimits& limits,
+        Now now)
+      : _client(client),
+        _clock(clock),
+        _randomness(randomness),
+        _log(log),
+        _limits(limits),
+        _now(std::move(now)) {}
+
+  void submit(HTTPRequest request, std::shared_ptr<SerialQueue> queue, Completion completion) {
+    const std::size_t heldBytes = heldBytesWithCopy(request);
+    const auto post = std::make_shared<Post>(
+        Post{std::move(request), std::move(queue), std::move(completion), heldBytes, _now(), {}});
+    const std::lock_guard lock(_mutex);
+    if (heldBytes > _limits.maximumPendingBytes - _heldBytes) return refuse(*post);
+    _heldBytes += heldBytes;
+    attempt(post);
+  }
+
+  void close() {
+    const std::lock_guard lock(_mutex);
+    _isClosed = true;
+    for (const auto& post : std::exchange(_waiting, {})) {
+      _heldBytes -= post->heldBytes;
+      tell(*post, std::move(post->lastResult));
+    }
+  }
+
+ private:
+  struct Post {
+    const HTTPRequest request;
+    const std::shared_ptr<SerialQueue> queue;
+    const Completion completion;
+    const std::size_t heldBytes;
+    const Moment begun;
+    HTTPResult lastResult;  ///< Of the last attempt, while it waits for the next.
+    unsigned retries = 0;
+  };
+  using SharedPost = std::shared_ptr<Post>;
+
+  static void tell(const Post& post, HTTPResult result) {
+    post.queue->async([completion = post.completion, result = std::move(result)] { completion(result); });
+  }
+
+  void refuse(const Post& post) const {
+    tell(post, failedRequest(post.request,
+                             fmt::format("too many unfinished requests, which may hold {} bytes",
+                                         _limits.maximumPendingBytes),
+                             HTTPFailure::TooMuchWaits));
+  }
+
+  /// Under the lock: the client is not used any more once this is closed.
+  void attempt(const SharedPost& post) {
+    _client.sendAsynchronousRequest(
+        post->request, post->queue,
+        [self = shared_from_this(), post](const HTTPResult& result) { self->attempted(post, result); });
+  }
+
+  void attempted(const SharedPost& post, const HTTPResult& result) {
+    if (waitForAnotherAttempt(post, result)) return;
+    {
+      const std::lock_guard lock(_mutex);
+      _heldBytes -= post->heldBytes;
+    }
+    post->completion(result);
+  }
+
+  bool waitForAnotherAttempt(const SharedPost& post, const HTTPResult& result) {
+    if (!isWorthRetrying(result)) return false;
+    const FailedAttempt failed{
+        post->retries, std::chrono::ceil<std::chrono::milliseconds>(_now() - post->begun), _clock.now()};
+    const auto wait = decideRetry(result, failed, uniformDraw(_randomness), _limits);
+    if (!wait) return false;
+    if (!hold(post, result, *wait)) return false;
+    asl_log(_log, LogLevel::Info, "Post failed, attempt {} of {} follows in {} ms: {}", post->retries + 1,
+            _limits.attempts + 1, wait->count(), reasonOf(post->request, result));
+    return true;
+  }
+
+  /// False when nothing is tried again any more.
+  bool hold(const SharedPost& post, const HTTPResult& result, std::chrono::milliseconds wait) {
+    const std::lock_guard lock(_mutex);
+    if (_isClosed) return false;
+    ++post->retries;
+    post->lastResult = result;
+    _waiting.insert(post);
+    post->queue->asyncAfter(wait, [self = shared_from_this(), post] { self->waited(post); });
+    return true;
+  }
+
+  void waited(const SharedPost& post) {
+    const std::lock_guard lock(_mutex);
+    if (_waiting.erase(post) > 0) attempt(post);
+  }
+
+  HTTPClient& _client;
+  const Clock& _clock;
+  Randomness& _randomness;
+  Log& _log;
+  const RetryLimits _limits;
+  const Now _now;
+  std::mutex _mutex;
+  std::size_t _heldBytes = 0;
+  std::unordered_set<SharedPost> _waiting;
+  bool _isClosed = false;
+};
+
+RetryingHTTPClient::RetryingHTTPClient(HTTPClient& client, const Clock& clock, Randomness& randomness,
+                                       Log& log, const RetryLimits& limits, Now now)
+    : _client(client),
+      _posts(std::make_shared<Posts>(client, clock, randomness, log, limits, std::move(now))) {}
+
+RetryingHTTPClient::~RetryingHTTPClient() { _posts->close(); }
+
+HTTPResult RetryingHTTPClient::sendSynchronousRequest(const HTTPRequest& request) {
+  return _client.sendSynchronousRequest(request);
+}
+
+void RetryingHTTPClient::sendAsynchronousRequest(HTTPRequest request, std::shared_ptr<SerialQueue> queue,
+                                                 Completion completion) {
+  _posts->submit(std::move(request), std::move(queue), std::move(completion));
+}
+
+}  // namespace tallyd::platform
