@@ -1,0 +1,104 @@
+// The real daemon under load, on real sockets, and what it takes while it carries it.
+#pragma once
+
+#include <atomic>
+#include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "integration/TestDaemon.h"
+#include "support/ProcessFigures.h"
+#include "support/RawServer.h"
+
+namespace tallyd::test {
+
+/// Takes posts and counts the events in them; keeps nothing.
+class CountingCollector {
+ public:
+  CountingCollector();
+  [[nodiscard]] std::string url() const { return _server.url("/events"); }
+  [[nodiscard]] std::uint64_t events() const { return _events; }
+
+ private:
+  void serve(RawConnection& connection);
+
+  std::atomic<std::uint64_t> _events{0};
+  RawServer _server;  ///< Last: its threads count.
+};
+
+/// Many clients at once: all are connected and have had an answer, some have started sessions and send.
+struct Crowd {
+  std::size_t connections = 10'000;
+  std::size_t active = 1'000;
+  std::size_t rounds = 20;  ///< In each, every active client sends a message and waits for the answer.
+  std::chrono::seconds atLeast{0};  ///< Rounds go on for this long.
+
+  /// As large as the limit of descriptors of this process and of the daemon's allows.
+  [[nodiscard]] static Crowd withinLimits();
+};
+
+/// The messages of a busy device's day: in each hour, `postingSessions` clients come, send
+/// `eventsOfAPostingSession` events that are posted one by one, and leave; `batchingSessions` clients send
+/// `eventsOfABatchingSession` events of three methods and flush after every 30th. The user consents, so that
+/// every post is written to the message log too. Clients of an hour come over four lanes, one after the other
+/// in each, as fast as they are served.
+struct Days {
+  std::size_t postingSessions = 40;
+  std::size_t eventsOfAPostingSession = 50;
+  std::size_t batchingSessions = 20;
+  std::size_t eventsOfABatchingSession = 120;
+  std::size_t firstHours = 12;  ///< Not sampled: until the allocator has what it comes to need.
+  std::size_t hours = 24;
+  std::chrono::seconds atLeast{0};  ///< Hours go on for this long.
+};
+
+/// What a run came to.
+struct LoadResult {
+  std::string name;
+  std::size_t connections = 0;  ///< Held at a time.
+  std::uint64_t sessions = 0;   ///< Started.
+  std::uint64_t messages = 0;   ///< Sent by clients.
+  double seconds = 0;
+  ProcessFigures before;                ///< After a first session.
+  std::vector<ProcessFigures> samples;  ///< One a round or an hour.
+  ProcessFigures after;                 ///< When all clients have left and everything is sent.
+  std::uint64_t accepted = 0;           ///< By the books.
+  std::uint64_t sent = 0;
+  std::uint64_t arrived = 0;  ///< At the collector.
+  bool balanced = false;      ///< In every look at the books.
+
+  /// Means over the second and the last tenth of the samples.
+  [[nodiscard]] double secondTenthBytes() const { return tenthBytes(1); }
+  [[nodiscard]] double lastTenthBytes() const { return tenthBytes(9); }
+  /// What the last tenth takes beyond the second is within what the allocator's own habits need.
+  [[nodiscard]] bool hasFlatMemory() const;
+  /// As few threads and descriptors as before, but for the collector's idle connections and the inspection's.
+  [[nodiscard]] bool leavesNothing() const;
+
+ private:
+  [[nodiscard]] double tenthBytes(std::size_t tenth) const;
+};
+
+/// A daemon with its servers. One run each.
+class LoadBench {
+ public:
+  LoadBench();
+
+  [[nodiscard]] LoadResult run(const Crowd& crowd);
+  [[nodiscard]] LoadResult run(const Days& days);
+
+ private:
+  [[nodiscard]] ProcessFigures figures() { return figuresOf(_daemon.process().pid()); }
+  void runFirstSession();
+  void finish(LoadResult& result);
+
+  StorebagServer _storebags;
+  CountingCollector _collector;
+  TestRoot _root{_storebags};
+  const int _prepared;  ///< The root, before the daemon reads it.
+  TestDaemon _daemon;
+};
+
+}  // namespace tallyd::test
