@@ -1,0 +1,55 @@
+// Property lists of all three forms: read, written as XML and as binary, and read again.
+
+#include <string>
+
+#include "FuzzTarget.h"
+#include "platform/property-list/KeyedArchive.h"
+#include "platform/property-list/PropertyList.h"
+
+namespace tallyd::fuzz {
+namespace {
+
+using namespace platform;
+
+int depthOf(const Value& value) {
+  int deepest = 0;
+  if (const auto* array = value.array()) {
+    for (const Value& element : *array) deepest = std::max(deepest, depthOf(element));
+    return deepest + 1;
+  }
+  if (const auto* dictionary = value.dictionary()) {
+    for (const auto& entry : *dictionary) deepest = std::max(deepest, depthOf(entry.value));
+    return deepest + 1;
+  }
+  return 0;
+}
+
+/// What was written can be read, and what was read back is written the same way ever after. Once it may
+/// change: what a form can't carry is replaced, and keys that this changes are sorted anew.
+void checkRoundTrip(const Value& value, PropertyListFormat format) {
+  const auto once = dataWithPropertyList(value, format);
+  if (!once) return;  // A date may lie outside the years that can be written.
+  const auto read = propertyListWithData(*once);
+  FUZZ_CHECK(read.value && read.error.empty());
+  const auto settled = dataWithPropertyList(*read.value, format);
+  FUZZ_CHECK(settled.has_value());
+  const auto reread = propertyListWithData(*settled);
+  FUZZ_CHECK(reread.value.has_value());
+  FUZZ_CHECK(dataWithPropertyList(*reread.value, format) == settled);
+}
+
+}  // namespace
+}  // namespace tallyd::fuzz
+
+int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+  using namespace tallyd::fuzz;
+  const auto read = propertyListWithData(Input(data, size).takeRest());
+  FUZZ_CHECK(read.value.has_value() == read.error.empty());
+  if (!read.value) return 0;
+  FUZZ_CHECK(depthOf(*read.value) <= kMaximumPropertyListDepth);
+  FUZZ_CHECK(!read.value->isNull());
+  (void)read.value->description();
+  checkRoundTrip(*read.value, PropertyListFormat::XML);
+  checkRoundTrip(*read.value, PropertyListFormat::Binary);
+  return 0;
+}
