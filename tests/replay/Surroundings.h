@@ -1,0 +1,66 @@
+// What the parts of the simulated world share.
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <string>
+
+#include "fakes/FakeQueues.h"
+#include "platform/Clock.h"
+#include "replay/Draws.h"
+#include "replay/Received.h"
+#include "replay/Trace.h"
+#include "replay/Weather.h"
+
+namespace tallyd::replay {
+
+/// The time of day on the simulation's timeline, which `skew` sets forwards and backwards.
+///
+/// The day lies in the past of every machine: the age of a real file is never reached by it.
+class SimulatedClock : public platform::Clock {
+ public:
+  explicit SimulatedClock(const fakes::FakeQueues& queues) : _queues(queues) {}
+
+  [[nodiscard]] platform::TimePoint now() const override {
+    constexpr std::chrono::seconds kStart{1'590'969'600};  // 2020-06-01 00:00:00 UTC.
+    return platform::TimePoint(kStart + _queues.now() + skew);
+  }
+
+  std::chrono::milliseconds skew{0};
+
+ private:
+  const fakes::FakeQueues& _queues;
+};
+
+/// Borrowed by each part; lives in the World.
+struct Surroundings {
+  explicit Surroundings(std::uint64_t seed) : draws(seed) {}
+
+  fakes::FakeQueues queues;
+  SimulatedClock clock{queues};
+  Draws draws;
+  Weather weather;
+  Trace trace{queues};
+  Received received;
+  Violations violations;
+  std::uint64_t callsWaiting = 0;  ///< Clients' calls in which time passes at the moment.
+  int edition = 0;                 ///< Of the storebags that the servers give out.
+  /// Lets time pass within a call that waits: everything else goes on meanwhile.
+  std::function<void(std::chrono::milliseconds)> elapse;
+
+  /// A duration from one millisecond to `longest`.
+  std::chrono::milliseconds upTo(std::chrono::milliseconds longest) {
+    return std::chrono::milliseconds(draws.between(1, longest.count()));
+  }
+  void violated(const std::string& text) { violations.add(trace.time(), text); }
+  /// A message reached the end of a channel.
+  void arrived(Channel channel, std::int64_t serial, int most) {
+    const int times = ++received.arrivals[{channel, serial}];
+    if (times > most) {
+      violated("message " + std::to_string(serial) + " came " + std::to_string(times) +
+               " times through channel " + std::to_string(static_cast<int>(channel)));
+    }
+  }
+};
+
+}  // namespace tallyd::replay
