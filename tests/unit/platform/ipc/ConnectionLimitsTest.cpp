@@ -28,6 +28,12 @@ class ConnectionLimitsTest : public testing::Test {
     queues.serveReadable();
   }
 
+  /// A connection holds itself until its client leaves.
+  void TearDown() override {
+    client.reset();
+    queues.serveReadable();
+  }
+
   bool put(std::string_view bytes) {
     const ssize_t sent = ::send(client.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
     queues.serveReadable();
