@@ -311,7 +311,7 @@ TEST_F(SessionTest, SendsTheDevicesFactsInTheStartRecordOfAnInternalBuild) {
                                             {"environmentType", 4}});
   root.setDevice({{"DeviceName", "Kasten"}, {"ReleaseType", "Internal"}, {"SerialNumber", "QX1234"}});
   TestDaemon daemon(root);
-  startedSession(daemon, sessionInfo(1));
+  const auto session = startedSession(daemon, sessionInfo(1));  // Its stop record would be posted too.
   ASSERT_TRUE(collector.waitForRequests(1));
   const auto start = receivedEvents(collector).at(0);
   EXPECT_EQ(start.string("SerialNum"), "QX1234");
