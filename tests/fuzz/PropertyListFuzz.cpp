@@ -25,8 +25,8 @@ int depthOf(const Value& value) {
 }
 
 /// What was written can be read, and what was read back reads the same ever after. Once it may change: what a
-/// form can't carry is replaced, and keys that this changes are sorted anew. The bytes may differ: which of
-/// two equal objects libplist writes once depends on bytes that it never set.
+/// form can't carry is replaced, and keys that this changes are sorted anew. The values count, not the bytes:
+/// after other inputs in one process, these have been seen to differ.
 void checkRoundTrip(const Value& value, PropertyListFormat format) {
   const auto once = dataWithPropertyList(value, format);
   if (!once) return;  // A date may lie outside the years that can be written.
