@@ -15,11 +15,7 @@ namespace tallyd::bench {
 
 class ServerProcess;
 
-/// Serves the socket until the process is ended: takes connections as the daemon does, and answers
-/// FetchDisplayURL and SendMessageWithCategory as it does without a backend, arguments unread.
-[[noreturn]] void runBareServer(const std::filesystem::path& socketPath);
-
-/// This program, running runBareServer() in a process of its own.
+/// The program of BareServerMain.cpp.
 class BareServer {
  public:
   BareServer();

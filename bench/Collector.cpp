@@ -55,6 +55,11 @@ std::size_t contentLengthOf(std::string_view head) {
   return length;
 }
 
+/// Answers are small and find room; false when the connection is broken.
+bool sendAll(int socket, std::string_view bytes) {
+  return ::send(socket, bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
+}
+
 }  // namespace
 
 struct Collector::Connection {
@@ -62,8 +67,9 @@ struct Collector::Connection {
   std::string received{};
 };
 
-Collector::Collector(std::string storebag)
-    : _storebagAnswer(
+Collector::Collector(const std::string& storebag, PostAnswers answers)
+    : _answers(answers),
+      _storebagAnswer(
           fmt::format("HTTP/1.1 200 OK\r\nCache-Control: max-age=86400\r\nContent-Length: {}\r\n\r\n{}",
                       storebag.size(), storebag)),
       _listener(listeningSocket()),
@@ -98,6 +104,19 @@ std::vector<std::string> Collector::takePosts() {
   return std::exchange(_posts, {});
 }
 
+std::vector<std::string> Collector::headersOfLastPost() {
+  constexpr std::string_view kEndOfLine = "\r\n";
+  const std::lock_guard lock(_mutex);
+  std::vector<std::string> headers;
+  // The first line is the request's.
+  for (auto end = _lastHead.find(kEndOfLine); end != std::string::npos;) {
+    const std::size_t start = end + kEndOfLine.size();
+    end = _lastHead.find(kEndOfLine, start);
+    headers.push_back(_lastHead.substr(start, end - start));
+  }
+  return headers;
+}
+
 void Collector::serve() {
   std::vector<Connection> connections;
   while (true) {
@@ -130,22 +149,24 @@ bool Collector::serveConnection(Connection& connection) {
 bool Collector::answerRequests(Connection& connection) {
   std::string& received = connection.received;
   while (true) {
-    const auto head = received.find(kEndOfHead);
-    if (head == std::string::npos) return true;
-    const std::size_t start = head + kEndOfHead.size();
-    const std::size_t length = contentLengthOf(std::string_view(received).substr(0, head));
+    const auto endOfHead = received.find(kEndOfHead);
+    if (endOfHead == std::string::npos) return true;
+    const std::string_view head = std::string_view(received).substr(0, endOfHead);
+    const std::size_t start = endOfHead + kEndOfHead.size();
+    const std::size_t length = contentLengthOf(head);
     if (received.size() < start + length) return true;
     const bool isPost = received.starts_with("POST ");
-    const std::string_view answer = isPost ? kPostAnswer : _storebagAnswer;
-    const ssize_t sent = ::send(connection.socket.get(), answer.data(), answer.size(), MSG_NOSIGNAL);
-    if (isPost) keepPost(received.substr(start, length));
+    const bool answered = (isPost && _answers == PostAnswers::Never) ||
+                          sendAll(connection.socket.get(), isPost ? kPostAnswer : _storebagAnswer);
+    if (isPost) keepPost(head, received.substr(start, length));
     received.erase(0, start + length);
-    if (sent != static_cast<ssize_t>(answer.size())) return false;
+    if (!answered) return false;
   }
 }
 
-void Collector::keepPost(std::string body) {
+void Collector::keepPost(std::string_view head, std::string body) {
   const std::lock_guard lock(_mutex);
+  _lastHead = head;
   _posts.push_back(std::move(body));
   if (_posts.size() >= _awaited) _enough.notify_all();
 }

@@ -8,6 +8,7 @@
 #include <cstdint>
 #include <mutex>
 #include <string>
+#include <string_view>
 #include <thread>
 #include <vector>
 
@@ -15,14 +16,17 @@
 
 namespace tallyd::bench {
 
-/// Plain HTTP/1.1 with kept-alive connections on a port that the system chooses. Posts are answered at once
-/// and kept as they came; every GET gets one fixed document, the signed storebag.
+/// What becomes of posts once they have been taken.
+enum class PostAnswers { AtOnce, Never };
+
+/// Plain HTTP/1.1 with kept-alive connections on a port that the system chooses. Posts are kept as they came;
+/// every GET gets one fixed document, the signed storebag, at once.
 ///
 /// One thread polls all connections. Threading: any thread.
 class Collector {
  public:
   /// @param storebag  the body of the answer to each GET.
-  explicit Collector(std::string storebag);
+  explicit Collector(const std::string& storebag, PostAnswers answers = PostAnswers::AtOnce);
   ~Collector();
   Collector(const Collector&) = delete;
   Collector& operator=(const Collector&) = delete;
@@ -33,6 +37,8 @@ class Collector {
   void waitForPosts(std::size_t count);
   /// The bodies of all posts since the last call.
   [[nodiscard]] std::vector<std::string> takePosts();
+  /// The header fields of the last post, a "NAME: VALUE" each.
+  [[nodiscard]] std::vector<std::string> headersOfLastPost();
 
  private:
   struct Connection;
@@ -40,8 +46,9 @@ class Collector {
   void serve();
   bool serveConnection(Connection& connection);
   bool answerRequests(Connection& connection);
-  void keepPost(std::string body);
+  void keepPost(std::string_view head, std::string body);
 
+  const PostAnswers _answers;
   const std::string _storebagAnswer;
   platform::FileDescriptor _listener;
   platform::FileDescriptor _stop;
@@ -50,6 +57,7 @@ class Collector {
   std::mutex _mutex;
   std::condition_variable _enough;
   std::vector<std::string> _posts;
+  std::string _lastHead;
   std::size_t _awaited = SIZE_MAX;
 
   std::thread _thread;

@@ -4,6 +4,7 @@
 #include <filesystem>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "Report.h"
 #include "ServerProcess.h"
@@ -11,20 +12,45 @@
 
 namespace tallyd::bench {
 
-/// The body of a storebag server's answer: a signed bag with one HTTPS post backend that has no filters.
-[[nodiscard]] std::string signedStorebag();
+/// In the collector's place where no session is started, so that nothing is fetched or posted.
+inline constexpr const char* kNowhere = "http://127.0.0.1:9";
 
-/// Runs while the object lives. Its log lines above warnings are left out, the others are thrown away.
-class Daemon {
+enum class Logging {
+  Warnings,   ///< Lines above warnings are left out, the others are thrown away.
+  Everything  ///< Every line goes to a file.
+};
+
+/// The files that a daemon finds: sandbox profile, framework, device properties, preferences.
+class DaemonRoot {
  public:
-  /// @param collectorURL  where it gets its storebags and posts its events to.
-  Daemon(const Settings& settings, const std::string& collectorURL);
+  /// @param collectorURL  where the daemon gets its storebags and posts its events to.
+  DaemonRoot(const Settings& settings, const std::string& collectorURL);
 
+  [[nodiscard]] const std::filesystem::path& path() const { return _folder.path(); }
   [[nodiscard]] std::filesystem::path socket() const;
-  [[nodiscard]] pid_t id() const { return _process->id(); }
+  /// Of the daemon that runs here, its program first.
+  [[nodiscard]] std::vector<std::string> arguments(const Settings& settings, Logging logging) const;
 
  private:
   fakes::TemporaryFolder _folder;
+};
+
+/// Runs while the object lives.
+class Daemon {
+ public:
+  Daemon(const Settings& settings, const std::string& collectorURL, Logging logging = Logging::Warnings);
+
+  [[nodiscard]] std::filesystem::path socket() const { return _root.socket(); }
+  [[nodiscard]] pid_t id() const { return _process->id(); }
+  /// Lines of the log so far. Only with Logging::Everything.
+  [[nodiscard]] std::size_t logLines() const;
+  /// Lines of the message log so far.
+  [[nodiscard]] std::size_t messageLogLines() const;
+
+ private:
+  [[nodiscard]] std::filesystem::path logFile() const { return _root.path() / "log"; }
+
+  DaemonRoot _root;
   std::unique_ptr<ServerProcess> _process;
 };
 

@@ -6,6 +6,8 @@
 #include <cstdint>
 #include <stdexcept>
 
+#include "Storebags.h"
+
 namespace tallyd::bench {
 
 using platform::Dictionary;
@@ -25,6 +27,18 @@ std::uint64_t scattered(std::uint64_t number) {
   return number ^ number >> 31;
 }
 
+/// Values of the hashed field that are as long as a hash is: the value itself is half as long.
+std::size_t hashesIn(std::string_view document) {
+  constexpr std::size_t kHashDigits = 64;
+  const std::string key = fmt::format(R"("{}":")", kHashedField);
+  std::size_t count = 0;
+  for (auto at = document.find(key); at != std::string_view::npos; at = document.find(key, at + 1)) {
+    const std::size_t start = at + key.size();
+    if (document.find('"', start) - start == kHashDigits) ++count;
+  }
+  return count;
+}
+
 }  // namespace
 
 VariableTexts variableTexts(std::size_t number) {
@@ -41,7 +55,7 @@ VariableTexts variableTexts(std::size_t number) {
 Dictionary payload(std::size_t number) {
   const VariableTexts texts = variableTexts(number);
   return {{"running", texts.running},
-          {"requestID", texts.request},
+          {kHashedField, texts.request},
           {"title", texts.title},
           {"container", "library.playlist.recently-added"},
           {"referrer", texts.referrer},
@@ -52,23 +66,37 @@ Dictionary payload(std::size_t number) {
           {"cached", true}};
 }
 
-void checkEvents(const std::vector<std::string>& documents, std::size_t events) {
-  constexpr std::string_view kKey = "\"running\":\"#";
-  std::vector<bool> seen(events);
-  std::size_t count = 0;
-  for (const std::string& document : documents) {
-    for (auto at = document.find(kKey); at != std::string::npos; at = document.find(kKey, at + kKey.size())) {
-      std::size_t number = events;
-      const char* digits = document.data() + at + kKey.size();
-      std::from_chars(digits, digits + kDigits, number);
-      if (number >= events) throw std::runtime_error("the collector received an event that nobody sent");
-      if (seen[number]) throw std::runtime_error(fmt::format("event {} was received twice", number));
-      seen[number] = true;
-      ++count;
-    }
+EventCheck::EventCheck(std::size_t events, std::size_t copies) : _copies(copies), _seen(events) {}
+
+void EventCheck::addDocument(std::string_view document) {
+  constexpr std::string_view kKey = R"("running":"#)";
+  const std::size_t before = _count;
+  for (auto at = document.find(kKey); at != std::string_view::npos;
+       at = document.find(kKey, at + kKey.size()))
+    add(document.data() + at + kKey.size());
+  if (hashesIn(document) != _count - before) {
+    throw std::runtime_error(fmt::format("\"{}\" has left unhashed", kHashedField));
   }
-  if (count != events)
-    throw std::runtime_error(fmt::format("{} of {} events were lost", events - count, events));
+}
+
+void EventCheck::addDatagram(std::string_view datagram) {
+  constexpr std::string_view kKey = " running=#";
+  const auto at = datagram.find(kKey);
+  if (at != std::string_view::npos) add(datagram.data() + at + kKey.size());
+}
+
+void EventCheck::finish() const {
+  const std::size_t expected = _seen.size() * _copies;
+  if (_count != expected)
+    throw std::runtime_error(fmt::format("{} of {} events were lost", expected - _count, expected));
+}
+
+void EventCheck::add(const char* digits) {
+  std::size_t number = _seen.size();
+  std::from_chars(digits, digits + kDigits, number);
+  if (number >= _seen.size()) throw std::runtime_error("an event has come that nobody sent");
+  if (++_seen[number] > _copies) throw std::runtime_error(fmt::format("event {} has come too often", number));
+  ++_count;
 }
 
 }  // namespace tallyd::bench

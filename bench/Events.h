@@ -34,8 +34,26 @@ struct VariableTexts {
 /// Ten fields, about 330 bytes as JSON.
 [[nodiscard]] platform::Dictionary payload(std::size_t number);
 
-/// Counts the running numbers in JSON documents that the collector received: throws std::runtime_error unless
-/// each from 0 to `events` - 1 is there just once.
-void checkEvents(const std::vector<std::string>& documents, std::size_t events);
+/// Counts the running numbers of events that arrived.
+class EventCheck {
+ public:
+  /// For the events 0 to `events` - 1, each of which is to arrive `copies` times.
+  explicit EventCheck(std::size_t events, std::size_t copies = 1);
+
+  /// A document, as the daemon posts it. Throws std::runtime_error when an event has come too often, when
+  /// nobody sent it, and when a field that was to be hashed is not.
+  void addDocument(std::string_view document);
+  /// A dashboard's datagram. Throws like addDocument(). Those of the daemon's own events are let through.
+  void addDatagram(std::string_view datagram);
+  /// Throws std::runtime_error when an event is missing.
+  void finish() const;
+
+ private:
+  void add(const char* digits);
+
+  std::size_t _copies;
+  std::vector<std::size_t> _seen;  ///< By running number.
+  std::size_t _count = 0;
+};
 
 }  // namespace tallyd::bench

@@ -32,12 +32,14 @@ IdleMemory idleMemoryOf(const Server& server, const Recording& recording) {
 }  // namespace
 
 void measureMemory(const Settings& settings, Figures& figures) {
-  Figure idle{.name = "memory/idle", .unit = "MiB", .floorName = "sd-bus alone"};
-  Figure connection{.name = "memory/connection", .unit = "KiB", .floorName = "sd-bus alone"};
+  Figure idle{
+      .name = "memory/idle", .unit = "MiB", .floorName = "sd-bus alone", .target = Target::figure(12)};
+  Figure connection{
+      .name = "memory/connection", .unit = "KiB", .floorName = "sd-bus alone", .target = Target::figure(16)};
   if (!settings.wants(idle.name) && !settings.wants(connection.name)) return;
   const Recording recording = recordClient(Posting::Unbatched);
   for (int run = 0; run < settings.runs(); ++run) {
-    const IdleMemory daemon = idleMemoryOf(Daemon(settings, "http://127.0.0.1:9"), recording);
+    const IdleMemory daemon = idleMemoryOf(Daemon(settings, kNowhere), recording);
     const IdleMemory floor = idleMemoryOf(BareServer(), recording);
     idle.add(daemon.idleBytes / kMebibyte, floor.idleBytes / kMebibyte);
     connection.add(daemon.bytesPerConnection / kKibibyte, floor.bytesPerConnection / kKibibyte);

@@ -6,6 +6,7 @@
 
 #include <chrono>
 #include <cstddef>
+#include <utility>
 #include <vector>
 
 namespace tallyd::bench {
@@ -47,6 +48,19 @@ struct Memory {
 };
 /// From /proc/PID/status (proc(5): VmRSS and VmHWM). Throws std::runtime_error when it can't be read.
 [[nodiscard]] Memory memoryOf(pid_t process);
+
+/// The median time of so many calls, in microseconds.
+template <class Call>
+[[nodiscard]] double medianMicroseconds(int calls, Call&& call) {
+  constexpr double kMicroseconds = 1e6;
+  std::vector<double> times;
+  for (int i = 0; i < calls; ++i) {
+    const Stopwatch stopwatch;
+    call();
+    times.push_back(stopwatch.seconds() * kMicroseconds);
+  }
+  return median(std::move(times));
+}
 
 /// Keeps the optimiser from leaving out what `value` is made by.
 template <class T>

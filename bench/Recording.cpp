@@ -80,6 +80,9 @@ class Listener {
     return take(size);
   }
 
+  /// Else the client would wait for its answers.
+  void hangUp() { _socket.reset(); }
+
  private:
   void hear() {
     char bytes[4096];
@@ -119,12 +122,16 @@ Recording recordClient(Posting posting) {
   TallyConnection client(path);
   const Dictionary sessionInfo{{std::string(kTallySessionInfoSessionID), 1},
                                {std::string(kTallySessionInfoClientType), kClientType},
+                               {std::string(kTallySessionInfoRequireUserInfo), true},
                                {std::string(kTallySessionInfoBatchEvent), posting == Posting::Batched}};
-  client.setSessionInfo(sessionInfo, std::nullopt, {}, [](const auto&) {});
+  const Dictionary userInfo{{std::string(kTallyUserInfoClientName), "Concert"},
+                            {std::string(kTallyUserInfoServiceName), "playback"}};
+  client.setSessionInfo(sessionInfo, userInfo, {}, [](const auto&) {});
   client.startConfig([](const auto&) {});
   client.fetchDisplayURL([](const auto&) {});
   client.sendMessage(kCategory, kType, payload(0), nullptr);
   client.flushMessages(nullptr);
+  client.flushMessages([](const auto&) {});
   Recording recording;
   recording.authentication = listener.authentication();
   recording.setSessionInfo = listener.message();
@@ -132,17 +139,42 @@ Recording recordClient(Posting posting) {
   recording.fetchDisplayURL = listener.message();
   recording.sendMessage = listener.message();
   recording.flushMessages = listener.message();
+  recording.flushAndAnswer = listener.message();
+  listener.hangUp();
   return recording;
 }
 
+ReplayingClient::ReplayingClient(const Recording& recording)
+    : _recording(recording), _socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {}
+
 ReplayingClient::ReplayingClient(const std::filesystem::path& socketPath, const Recording& recording)
-    : _recording(recording), _socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
+    : ReplayingClient(recording) {
+  connect(socketPath);
+  awaitAcceptance();
+}
+
+std::vector<ReplayingClient> ReplayingClient::crowd(std::size_t size, const std::filesystem::path& socketPath,
+                                                    const Recording& recording) {
+  std::vector<ReplayingClient> clients;
+  clients.reserve(size);
+  for (std::size_t i = 0; i < size; ++i) {
+    clients.push_back(ReplayingClient(recording));
+    clients.back().connect(socketPath);
+  }
+  for (const ReplayingClient& client : clients) client.awaitAcceptance();
+  return clients;
+}
+
+void ReplayingClient::connect(const std::filesystem::path& socketPath) {
   const sockaddr_un address = addressOf(socketPath);
   if (!_socket ||
       ::connect(_socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
     fail("connect");
   }
   write(_recording.authentication);
+}
+
+void ReplayingClient::awaitAcceptance() const {
   for (int lines = 0; lines < kLinesOfAcceptance;) {
     char byte = 0;
     read(&byte, 1);
@@ -150,25 +182,30 @@ ReplayingClient::ReplayingClient(const std::filesystem::path& socketPath, const 
   }
 }
 
-void ReplayingClient::call(std::string_view message) {
+void ReplayingClient::send(std::string_view message) {
   std::string sent;
-  append(sent, std::string(message));
+  append(sent, message);
   write(sent);
+}
+
+std::string ReplayingClient::call(std::string_view message) {
+  send(message);
   char header[kFixedHeader];
   read(header, sizeof header);
   std::string rest(sizeOfMessage(header) - kFixedHeader, '\0');
   read(rest.data(), rest.size());
   if (header[kTypeOffset] != kMethodReturn) throw std::runtime_error("the daemon answers with an error");
+  return rest;
 }
 
-void ReplayingClient::append(std::string& chunk, const std::string& message) {
+void ReplayingClient::append(std::string& chunk, std::string_view message) {
   const std::size_t start = chunk.size();
   chunk += message;
   ++_serial;
   std::memcpy(&chunk[start + kSerialOffset], &_serial, sizeof _serial);
 }
 
-void ReplayingClient::sendEvents(std::size_t first, std::size_t count, Posting posting) {
+void ReplayingClient::sendEvents(std::size_t first, std::size_t count, std::size_t flushEvery) {
   std::vector<std::size_t> places;
   const VariableTexts recorded = variableTexts(0);
   for (const std::string* text : recorded.all()) places.push_back(placeOf(*text, _recording.sendMessage));
@@ -178,8 +215,9 @@ void ReplayingClient::sendEvents(std::size_t first, std::size_t count, Posting p
     append(chunk, _recording.sendMessage);
     const VariableTexts texts = variableTexts(number);
     for (std::size_t i = 0; i < places.size(); ++i) put(chunk, start + places[i], *texts.all()[i]);
-    if ((number + 1 - first) % kBatchSize != 0) continue;
-    if (posting == Posting::Batched) append(chunk, _recording.flushMessages);
+    const std::size_t sent = number + 1 - first;
+    if (flushEvery != kNoFlush && sent % flushEvery == 0) append(chunk, _recording.flushMessages);
+    if (sent % kBatchSize != 0) continue;
     write(chunk);
     chunk.clear();
   }

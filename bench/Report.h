@@ -1,6 +1,7 @@
 // The figures of one run, each beside its floor: collected, then shown as a table and as JSON.
 #pragma once
 
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -23,12 +24,27 @@ struct Settings {
 
 enum class Better { Lower, Higher };
 
+/// What a figure is not to be worse than.
+struct Target {
+  enum class Of {
+    Ratio,  ///< The limit is for Figure::ratio().
+    Figure  ///< The limit is for the figure itself, in its unit.
+  };
+  Of of = Of::Ratio;
+  double limit = 0;
+
+  [[nodiscard]] static Target ratio(double limit) { return {Of::Ratio, limit}; }
+  [[nodiscard]] static Target figure(double limit) { return {Of::Figure, limit}; }
+};
+
 /// One figure: what each run measured, and what each run's floor was.
 struct Figure {
   std::string name;
   std::string unit;
   std::string floorName;
   Better better = Better::Lower;
+  std::optional<Target> target{};
+  std::string leftOut{};  ///< Why it can't be measured here; then there are no values, and no floors.
   std::vector<double> values{};
   std::vector<double> floors{};
 
@@ -38,11 +54,15 @@ struct Figure {
   }
   /// How many times the floor's cost the figure is, of the medians; 1 is the floor itself.
   [[nodiscard]] double ratio() const;
+  /// Of the medians; nothing without a target, and for a figure that was left out.
+  [[nodiscard]] std::optional<bool> meetsTarget() const;
 };
 
 /// Lines as wide as a terminal's, with a heading.
 [[nodiscard]] std::string tableOf(const std::vector<Figure>& figures);
-/// {"figures": [{"name", "unit", "floorName", "figure", "floor", "ratio", "values", "floors"}]}.
+/// {"figures": [{"name", "unit", "floorName", "figure", "floor", "ratio", "target", "targetOf", "met",
+/// "values", "floors"}]}: "targetOf" is "ratio" or "figure" and missing, like "target", where there is none;
+/// "met" is "yes", "no" or "-". A figure that was left out has "name", "unit" and "leftOut", the reason.
 [[nodiscard]] std::string jsonOf(const std::vector<Figure>& figures);
 
 }  // namespace tallyd::bench

@@ -1,6 +1,7 @@
 #include "ServerProcess.h"
 
 #include <fcntl.h>
+#include <fmt/format.h>
 #include <spawn.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
@@ -21,6 +22,9 @@ using platform::FileDescriptor;
 namespace {
 
 constexpr timeval kPatience{20, 0};
+constexpr std::string_view kReadiness = "NOTIFY_SOCKET=";
+constexpr std::string_view kLocale = "LC_ALL=";
+constexpr const char* kLocaleOfServers = "en_US.UTF-8";
 
 /// Ends a child that did not become what was wanted.
 [[noreturn]] void giveUp(pid_t id, const std::string& why) {
@@ -42,24 +46,36 @@ FileDescriptor readinessSocket(const std::filesystem::path& path) {
   return socket;
 }
 
-pid_t spawn(std::vector<std::string> arguments, const std::string& readiness) {
-  std::vector<char*> argumentPointers;
-  for (std::string& argument : arguments) argumentPointers.push_back(argument.data());
-  argumentPointers.push_back(nullptr);
-  std::string notify = "NOTIFY_SOCKET=" + readiness;
-  std::vector<char*> environment{notify.data()};
-  for (char** entry = environ; *entry; ++entry) {
-    if (!std::string_view(*entry).starts_with("NOTIFY_SOCKET=")) environment.push_back(*entry);
-  }
-  environment.push_back(nullptr);
+/// As exec(3) takes them.
+std::vector<char*> pointersTo(std::vector<std::string>& texts) {
+  std::vector<char*> pointers;
+  pointers.reserve(texts.size() + 1);
+  for (std::string& text : texts) pointers.push_back(text.data());
+  pointers.push_back(nullptr);
+  return pointers;
+}
 
+std::vector<std::string> environmentOf(const std::string& readiness) {
+  std::vector<std::string> environment{std::string(kReadiness) + readiness,
+                                       std::string(kLocale) + kLocaleOfServers};
+  for (char** entry = environ; *entry; ++entry) {
+    const std::string_view text = *entry;
+    if (!text.starts_with(kReadiness) && !text.starts_with(kLocale)) environment.emplace_back(text);
+  }
+  return environment;
+}
+
+pid_t spawn(std::vector<std::string> arguments, const std::string& readiness, const std::string& output) {
+  constexpr int kHow = O_WRONLY | O_CREAT | O_APPEND;
+  constexpr mode_t kMode = 0600;
+  std::vector<std::string> environment = environmentOf(readiness);
   posix_spawn_file_actions_t actions;
   posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
-  posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, "/dev/null", O_WRONLY, 0);
+  posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, output.c_str(), kHow, kMode);
+  posix_spawn_file_actions_adddup2(&actions, STDOUT_FILENO, STDERR_FILENO);
   pid_t id = -1;
-  const int error =
-      posix_spawn(&id, argumentPointers[0], &actions, nullptr, argumentPointers.data(), environment.data());
+  const int error = posix_spawn(&id, arguments[0].c_str(), &actions, nullptr, pointersTo(arguments).data(),
+                                pointersTo(environment).data());
   posix_spawn_file_actions_destroy(&actions);
   if (error != 0) throw std::system_error(error, std::generic_category(), arguments[0]);
   return id;
@@ -67,11 +83,12 @@ pid_t spawn(std::vector<std::string> arguments, const std::string& readiness) {
 
 }  // namespace
 
-ServerProcess::ServerProcess(std::vector<std::string> arguments, const std::filesystem::path& folder) {
+ServerProcess::ServerProcess(std::vector<std::string> arguments, const std::filesystem::path& folder,
+                             const std::string& output) {
   const auto path = folder / "ready";
   const FileDescriptor socket = readinessSocket(path);
   const std::string program = arguments[0];
-  _id = spawn(std::move(arguments), path.string());
+  _id = spawn(std::move(arguments), path.string(), output);
   char message[256];
   const ssize_t length = ::recv(socket.get(), message, sizeof message, 0);
   if (length > 0 && std::string_view(message, static_cast<std::size_t>(length)).starts_with("READY=1"))
@@ -84,11 +101,24 @@ ServerProcess::~ServerProcess() {
   ::waitpid(_id, nullptr, 0);
 }
 
+std::string programBeside(const std::string& name) {
+  return (std::filesystem::read_symlink("/proc/self/exe").parent_path() / name).string();
+}
+
 void raiseDescriptorLimit() {
   rlimit limit{};
   if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
   limit.rlim_cur = limit.rlim_max;
   setrlimit(RLIMIT_NOFILE, &limit);
+}
+
+std::string whyTooMany(std::size_t connections) {
+  constexpr std::size_t kForOtherThings = 100;
+  rlimit limit{};
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return "the limit of open descriptors can't be read";
+  const std::size_t needed = connections + kForOtherThings;
+  if (limit.rlim_cur >= needed) return "";
+  return fmt::format("{} open descriptors are needed and {} allowed (ulimit -Hn)", needed, limit.rlim_cur);
 }
 
 }  // namespace tallyd::bench

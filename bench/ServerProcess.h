@@ -3,6 +3,7 @@
 
 #include <sys/types.h>
 
+#include <cstddef>
 #include <filesystem>
 #include <string>
 #include <vector>
@@ -12,9 +13,12 @@ namespace tallyd::bench {
 /// Started and ready when the constructor returns, ended and reaped when the destructor does.
 class ServerProcess {
  public:
-  /// Runs arguments[0]; what it writes is dropped. Waits until it tells that it is ready, as sd_notify(3) has
-  /// it, through a socket in `folder`. Throws std::runtime_error when it doesn't.
-  ServerProcess(std::vector<std::string> arguments, const std::filesystem::path& folder);
+  /// Runs arguments[0], in the country that bench/Storebags.h lists. Waits until it tells that it is ready,
+  /// as sd_notify(3) has it, through a socket in `folder`. Throws std::runtime_error when it doesn't.
+  ///
+  /// @param output  The file that takes what it writes, at its end.
+  ServerProcess(std::vector<std::string> arguments, const std::filesystem::path& folder,
+                const std::string& output = "/dev/null");
   ~ServerProcess();
   ServerProcess(const ServerProcess&) = delete;
   ServerProcess& operator=(const ServerProcess&) = delete;
@@ -25,7 +29,12 @@ class ServerProcess {
   pid_t _id = -1;
 };
 
+/// The path of a program that lies where this one does.
+[[nodiscard]] std::string programBeside(const std::string& name);
+
 /// Raises this process's limit of open descriptors, which children inherit, as far as the system lets it.
 void raiseDescriptorLimit();
+/// Why this process and a child can't have so many connections at a time; empty when they can.
+[[nodiscard]] std::string whyTooMany(std::size_t connections);
 
 }  // namespace tallyd::bench

@@ -33,7 +33,7 @@ Deflater::Deflater() : _stream(std::make_unique<z_stream>()) {
 
 Deflater::~Deflater() { deflateEnd(_stream.get()); }
 
-std::size_t Deflater::deflate(std::string_view input) {
+std::string_view Deflater::deflate(std::string_view input) {
   check(deflateReset(_stream.get()), Z_OK);
   const auto bound = static_cast<std::size_t>(deflateBound(_stream.get(), input.size()));
   if (_output.size() < bound) _output.resize(bound);
@@ -42,7 +42,7 @@ std::size_t Deflater::deflate(std::string_view input) {
   _stream->next_out = _output.data();
   _stream->avail_out = static_cast<uInt>(_output.size());
   check(::deflate(_stream.get(), Z_FINISH), Z_STREAM_END);
-  return _stream->total_out;
+  return {reinterpret_cast<const char*>(_output.data()), _stream->total_out};
 }
 
 double zlibProcessorSeconds(const std::vector<std::string>& documents) {

@@ -1,7 +1,6 @@
 // What compressing the same bytes with zlib alone costs.
 #pragma once
 
-#include <cstddef>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -20,8 +19,8 @@ class Deflater {
   Deflater(const Deflater&) = delete;
   Deflater& operator=(const Deflater&) = delete;
 
-  /// The bytes of the result.
-  std::size_t deflate(std::string_view input);
+  /// The result; stays until the next call.
+  std::string_view deflate(std::string_view input);
 
  private:
   const std::unique_ptr<z_stream_s> _stream;

@@ -3,11 +3,9 @@
 #include <CLI/CLI.hpp>
 #include <algorithm>
 #include <csignal>
-#include <filesystem>
 #include <fstream>
 #include <iostream>
 
-#include "BareBus.h"
 #include "Figures.h"
 #include "ServerProcess.h"
 
@@ -18,8 +16,9 @@ using tallyd::bench::Figures;
 using tallyd::bench::Settings;
 
 constexpr const char* kFooter = R"(
-Figures: round-trip, batch, throughput, cpu, memory; bench/README.md says what each means. Every figure is the median
-of several runs, beside its floor from the same runs; the ratio is how many times the floor's cost it is.
+Figures: round-trip, batch, throughput, cpu, dashboard, growth, hanging, idle, start, memory, storebag; bench/README.md
+says what each means. Every figure is the median of several runs, beside its floor from the same runs; the ratio is how
+many times the floor's cost it is. A target is for the ratio where it has no unit, else for the figure itself.
 
 Example, the throughput and the processor time of unbatched events, for a first impression:
   tallyd-bench --quick --only throughput/unbatched --json figures.json
@@ -32,14 +31,16 @@ struct Options {
   Settings settings;
   bool noSandbox = false;
   std::string jsonFile;
-  std::string bareServerSocket;
 };
 
 int run(const Options& options) {
   const Settings& settings = options.settings;
   Figures figures;
-  for (const auto measure : {tallyd::bench::measureRoundTrips, tallyd::bench::measureBatch,
-                             tallyd::bench::measureThroughput, tallyd::bench::measureMemory}) {
+  for (const auto measure :
+       {tallyd::bench::measureRoundTrips, tallyd::bench::measureBatch, tallyd::bench::measureThroughput,
+        tallyd::bench::measureDashboard, tallyd::bench::measureGrowth, tallyd::bench::measureHanging,
+        tallyd::bench::measureIdleCrowd, tallyd::bench::measureStart, tallyd::bench::measureMemory,
+        tallyd::bench::measureStorebags}) {
     measure(settings, figures);
   }
   std::erase_if(figures, [&](const Figure& figure) { return !settings.wants(figure.name); });
@@ -61,7 +62,7 @@ int run(const Options& options) {
 int main(int argumentCount, char** arguments) {
   Options options;
   Settings& settings = options.settings;
-  settings.program = (std::filesystem::read_symlink("/proc/self/exe").parent_path() / "tallyd").string();
+  settings.program = tallyd::bench::programBeside("tallyd");
   settings.sources = TALLYD_SOURCE_DIR;
   CLI::App app("Measures the daemon against floors that are measured in the same run.", "tallyd-bench");
   app.footer(kFooter);
@@ -70,8 +71,6 @@ int main(int argumentCount, char** arguments) {
   app.add_option("--json", options.jsonFile, "Also write the figures, with every run's value, to this file");
   app.add_flag("--no-sandbox", options.noSandbox,
                "Run the daemon unconfined, on a kernel that can't confine it");
-  app.add_option("--bare-server", options.bareServerSocket)
-      ->group("");  // How the program starts its own floor.
   try {
     app.parse(argumentCount, arguments);
   } catch (const CLI::ParseError& error) {
@@ -80,7 +79,6 @@ int main(int argumentCount, char** arguments) {
   settings.sandbox = !options.noSandbox;
   std::signal(SIGPIPE, SIG_IGN);
   try {
-    if (!options.bareServerSocket.empty()) tallyd::bench::runBareServer(options.bareServerSocket);
     tallyd::bench::raiseDescriptorLimit();
     return run(options);
   } catch (const std::exception& error) {

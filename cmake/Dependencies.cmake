@@ -38,3 +38,7 @@ if(TALLYD_TESTS)
   find_package(GTest REQUIRED)
   include(GoogleTest)
 endif()
+
+if(TALLYD_BENCH)
+  find_package(benchmark REQUIRED)
+endif()

@@ -6,7 +6,7 @@ BUILD_PACKAGES=(
   build-essential g++ cmake ninja-build ccache mold pkg-config
   libsystemd-dev libasio-dev libcurl4-openssl-dev libssl-dev zlib1g-dev libplist-dev libexpat1-dev libicu-dev libseccomp-dev
   rapidjson-dev libfmt-dev libcli11-dev libcpp-httplib-dev libbrotli-dev
-  libgtest-dev libgmock-dev
+  libgtest-dev libgmock-dev libbenchmark-dev
 )
 
 # What the daemon needs to run: systemd brings the tool that gives a machine its ID.
