@@ -1,10 +1,7 @@
-#include <sys/time.h>
-
-#include <stdexcept>
-
 #include "Events.h"
 #include "Figures.h"
 #include "Measure.h"
+#include "Samples.h"
 #include "ZlibFloor.h"
 #include "backends/https-post/EventRecord.h"
 #include "backends/https-post/PostBody.h"
@@ -19,45 +16,23 @@ namespace {
 constexpr int kBatches = 200;
 constexpr int kQuickBatches = 30;
 
-class NoLog final : public platform::Log {
- public:
-  NoLog() : Log(platform::LogLevel::Warning) {}
-  void open(std::string_view /*identity*/, std::string_view /*facility*/) override {}
-  void close() override {}
-  void write(platform::LogLevel /*level*/, std::string_view message) override {
-    throw std::runtime_error(std::string(message));
-  }
-};
-
-EventFacts factsOf(std::size_t number) {
-  constexpr double kSessionStart = 1'760'000'123.25;
-  return {.sessionStart = kSessionStart,
-          .sender = "pl",
-          .clientVersion = 1,
-          .sessionID = "5Q0kK3sVTv2jXW9mJm0b7A==",
-          .eventNumber = static_cast<std::uint16_t>(number),
-          .method = kCategory,
-          .status = kType,
-          .eventTime = kSessionStart + static_cast<double>(number) / 8,
-          .productFamily = "Kasten",
-          .productModel = "Kasten7,1",
-          .osVersion = "12",
-          .build = "6.1.0-18-amd64",
-          .isInternal = false,
-          .reportVersionMajor = 7,
-          .reportVersionMinor = 0,
-          .timezoneOffset = std::chrono::seconds(3600)};
-}
-
 std::string jsonOfEvents(const std::vector<Dictionary>& payloads, platform::Log& log) {
-  std::vector<Dictionary> events;
-  events.reserve(payloads.size());
   EventRecords records;
+  std::vector<EventRecord> batch;
+  batch.reserve(payloads.size());
   for (std::size_t number = 0; number < payloads.size(); ++number) {
-    events.push_back(records.record(payloads[number], factsOf(number)));
+    batch.push_back(records.record(payloads[number], eventFacts(number)));
   }
-  for (Dictionary& event : events) sanitizeEventForJSON(event, log);
-  return *postBody({1'760'000'200, 125'000}, "6f1cbb53-52a8-5f0c-9d0a-0d1a4c6b7e21", std::move(events));
+  platform::JSONText array;
+  EventFields fields;
+  array.startArray();
+  for (const EventRecord& record : batch) {
+    record.fieldsInto(fields);
+    sanitizeEventForJSON(fields, log);
+    appendEvent(array, fields);
+  }
+  array.endArray();
+  return postBody({1'760'000'200, 125'000}, "6f1cbb53-52a8-5f0c-9d0a-0d1a4c6b7e21", array.view());
 }
 
 /// Microseconds of processor time for one of `count` calls.

@@ -5,8 +5,8 @@
 #include <array>
 #include <stdexcept>
 
-#include "Events.h"
 #include "backends/TallyBackend.h"
+#include "backends/https-post/PostBody.h"
 #include "framework/TallyKeys.h"
 
 namespace tallyd::bench {
@@ -111,15 +111,35 @@ Dictionary userInfo() {
           {std::string(kTallyUserInfoServiceName), "com.quillon.service.playback"}};
 }
 
-std::vector<Dictionary> decoratedEvents(std::size_t count) {
+std::vector<EventRecord> eventRecords(std::size_t count) {
   EventRecords records;
-  std::vector<Dictionary> events;
+  std::vector<EventRecord> events;
   events.reserve(count);
   for (std::size_t number = 0; number < count; ++number) {
     events.push_back(records.record(payload(number), eventFacts(number)));
-    events.back().merge(userInfo());
   }
   return events;
+}
+
+void FreshFields::renew() {
+  for (std::size_t number = 0; number < _records.size(); ++number) {
+    _records[number].fieldsInto(_fields[number]);
+    _fields[number].merge(_userInfo);
+  }
+}
+
+std::string documentOf(std::size_t events) {
+  const Dictionary info = userInfo();
+  platform::JSONText array;
+  EventFields fields;
+  array.startArray();
+  for (const EventRecord& record : eventRecords(events)) {
+    record.fieldsInto(fields);
+    fields.merge(info);
+    appendEvent(array, fields);
+  }
+  array.endArray();
+  return postBody({1'760'000'200, 125'000}, "6f1cbb53-52a8-5f0c-9d0a-0d1a4c6b7e21", array.view());
 }
 
 Array filterRules(std::size_t count, Hashing hashing) {

@@ -2,9 +2,11 @@
 #pragma once
 
 #include <cstddef>
+#include <string>
 #include <string_view>
 #include <vector>
 
+#include "Events.h"
 #include "backends/https-post/EventRecord.h"
 #include "platform/Log.h"
 #include "platform/Value.h"
@@ -27,9 +29,25 @@ class NoLog final : public platform::Log {
 [[nodiscard]] platform::Dictionary userInfo();
 
 inline constexpr std::size_t kDecoratedFields = 28;
-/// Records of the payloads from 0 on with the user info set over them, as they come to the filters. No
-/// storage is shared with anything else.
-[[nodiscard]] std::vector<platform::Dictionary> decoratedEvents(std::size_t count);
+/// Records of the payloads from 0 on. No payload is shared with anything else.
+[[nodiscard]] std::vector<EventRecord> eventRecords(std::size_t count);
+
+/// The fields of a batch of records with the user info set over them, as they come to the filters.
+class FreshFields {
+ public:
+  FreshFields() { renew(); }
+  void renew();  ///< As if nobody had touched them.
+
+  [[nodiscard]] std::vector<EventFields>& events() { return _fields; }
+
+ private:
+  const platform::Dictionary _userInfo = userInfo();
+  const std::vector<EventRecord> _records = eventRecords(kBatchSize);
+  std::vector<EventFields> _fields = std::vector<EventFields>(kBatchSize);
+};
+
+/// The body of a post of so many records with the user info.
+[[nodiscard]] std::string documentOf(std::size_t events);
 
 enum class Hashing { No, Yes };
 

@@ -13,7 +13,7 @@ using platform::Dictionary;
 void filterWith(benchmark::State& state, const Array& rules) {
   EventFilters filters;
   filters.createFiltersFromArray(rules);
-  runOnFreshEvents(state, [&](Dictionary& event) { filters.filterEvent(event); });
+  runOnFreshEvents(state, [&](EventFields& event) { filters.filterEvent(event); });
 }
 
 void filter(benchmark::State& state, Hashing hashing) {

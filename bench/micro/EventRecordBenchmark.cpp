@@ -41,5 +41,16 @@ void recordFirst(benchmark::State& state) {
 }
 BENCHMARK(recordFirst)->Name("event-record/first");
 
+/// What a flush does with each record first.
+void layOut(benchmark::State& state) {
+  FreshFields fresh;
+  for (auto _ : state) {
+    fresh.renew();
+    benchmark::DoNotOptimize(fresh.events());
+  }
+  state.SetItemsProcessed(state.iterations() * static_cast<std::int64_t>(kBatchSize));
+}
+BENCHMARK(layOut)->Name("event-record/fields-of-50");
+
 }  // namespace
 }  // namespace tallyd::bench

@@ -2,8 +2,8 @@
 
 #include <string>
 
-#include "Documents.h"
 #include "Events.h"
+#include "Samples.h"
 #include "ZlibFloor.h"
 #include "support/GzipCompression.h"
 

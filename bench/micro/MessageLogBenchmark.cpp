@@ -3,7 +3,7 @@
 #include <string>
 
 #include "Device.h"
-#include "Documents.h"
+#include "Samples.h"
 #include "support/MessageLog.h"
 
 namespace tallyd::bench {

@@ -12,20 +12,29 @@ using platform::Dictionary;
 /// All fields are fit for JSON as they are.
 void sanitize(benchmark::State& state) {
   NoLog log;
-  runOnFreshEvents(state, [&](Dictionary& event) { sanitizeEventForJSON(event, log); });
+  runOnFreshEvents(state, [&](EventFields& event) { sanitizeEventForJSON(event, log); });
 }
 BENCHMARK(sanitize)->Name("post-body/sanitize");
 
 /// One field is a date; setting it is measured too.
 void sanitizeDate(benchmark::State& state) {
-  constexpr platform::Date kDate{1'760'000'000.5};
+  const Dictionary started{{"startedAt", platform::Date{1'760'000'000.5}}};
   NoLog log;
-  runOnFreshEvents(state, [&](Dictionary& event) {
-    event.set("startedAt", kDate);
+  runOnFreshEvents(state, [&](EventFields& event) {
+    event.merge(started);
     sanitizeEventForJSON(event, log);
   });
 }
 BENCHMARK(sanitizeDate)->Name("post-body/sanitize-date");
+
+void appendFields(benchmark::State& state) {
+  runOnFreshEvents(state, [](EventFields& event) {
+    platform::JSONText json;
+    appendEvent(json, event);
+    benchmark::DoNotOptimize(json.view());
+  });
+}
+BENCHMARK(appendFields)->Name("post-body/append-event");
 
 }  // namespace
 }  // namespace tallyd::bench

@@ -4,15 +4,12 @@
 #include <rapidjson/error/en.h>
 #include <rapidjson/memorystream.h>
 #include <rapidjson/reader.h>
-#include <rapidjson/stringbuffer.h>
 #include <rapidjson/writer.h>
 
 #include <charconv>
 #include <cmath>
-#include <cstdlib>
 #include <cstring>
-#include <limits>
-#include <new>
+#include <utility>
 #include <vector>
 
 #include "platform/UTF8.h"
@@ -23,29 +20,13 @@ namespace {
 
 // Writing
 
-/// Says that there is no memory left; RapidJSON, left to itself, would write where it got none.
-class ThrowingAllocator {
- public:
-  [[maybe_unused]] static constexpr bool kNeedFree = true;  // For the library.
-
-  static void* Malloc(std::size_t size) { return size == 0 ? nullptr : checked(std::malloc(size)); }
-  static void* Realloc(void* memory, std::size_t /*size*/, std::size_t newSize) {
-    if (newSize > 0) return checked(std::realloc(memory, newSize));
-    std::free(memory);
-    return nullptr;
-  }
-  static void Free(void* memory) { std::free(memory); }
-  bool operator==(const ThrowingAllocator&) const { return true; }
-
- private:
-  static void* checked(void* memory) {
-    if (!memory) throw std::bad_alloc();
-    return memory;
-  }
+/// Where the library, which formats the real numbers, writes.
+struct TextEnd {
+  using Ch = char;
+  std::string& text;
+  void Put(char byte) { text += byte; }
+  void Flush() {}
 };
-
-using JSONBuffer = rapidjson::GenericStringBuffer<rapidjson::UTF8<>, ThrowingAllocator>;
-using JSONWriter = rapidjson::Writer<JSONBuffer, rapidjson::UTF8<>, rapidjson::UTF8<>, ThrowingAllocator>;
 
 /// Whether eight bytes all stand for themselves in a JSON string: ASCII, no control, no quote, no backslash.
 bool standForThemselves(std::uint64_t bytes) {
@@ -64,109 +45,175 @@ bool standsForItself(unsigned char byte) {
 
 /// Length of the longest start of `text` that needs no look at single characters.
 std::size_t plainLength(std::string_view text) {
+  const auto wordAt = [text](std::size_t place) {
+    std::uint64_t word = 0;
+    std::memcpy(&word, text.data() + place, sizeof word);
+    return word;
+  };
+  constexpr std::size_t kWord = sizeof(std::uint64_t);
   std::size_t length = 0;
-  for (std::uint64_t word = 0; length + sizeof word <= text.size(); length += sizeof word) {
-    std::memcpy(&word, text.data() + length, sizeof word);
-    if (!standForThemselves(word)) break;
-  }
+  while (length + kWord <= text.size() && standForThemselves(wordAt(length))) length += kWord;
+  // The last ones with some that have been looked at already.
+  if (length > 0 && length + kWord > text.size() && standForThemselves(wordAt(text.size() - kWord)))
+    return text.size();
   while (length < text.size() && standsForItself(static_cast<unsigned char>(text[length]))) ++length;
   return length;
 }
 
-/// RapidJSON's writer with strings that are copied run by run instead of byte by byte, and checked on the
-/// way.
-class ValueWriter : public JSONWriter {
+void appendEscape(std::string& text, unsigned char byte) {
+  switch (byte) {
+    case '"':
+      text += "\\\"";
+      return;
+    case '\\':
+      text += "\\\\";
+      return;
+    case '\b':
+      text += "\\b";
+      return;
+    case '\f':
+      text += "\\f";
+      return;
+    case '\n':
+      text += "\\n";
+      return;
+    case '\r':
+      text += "\\r";
+      return;
+    case '\t':
+      text += "\\t";
+      return;
+    default:
+      constexpr std::string_view kDigits = "0123456789ABCDEF";
+      text += "\\u00";
+      text += kDigits[byte >> 4];
+      text += kDigits[byte & 15];
+  }
+}
+
+}  // namespace
+
+/// Writes one value, whatever it holds.
+class JSONText::Writer {
  public:
-  explicit ValueWriter(JSONBuffer& buffer) : JSONWriter(buffer) {}
+  explicit Writer(JSONText& text) : _json(text) {}
 
   bool write(const Value& value) { return value.visit(*this); }
 
-  bool operator()(std::monostate) { return Null(); }
-  bool operator()(bool value) { return Bool(value); }
-  bool operator()(std::int64_t value) { return Int64(value); }
-  bool operator()(std::uint64_t value) { return Uint64(value); }
-  bool operator()(double value) { return Double(value); }
+  bool operator()(std::monostate) { return literal("null"); }
+  bool operator()(bool value) { return literal(value ? "true" : "false"); }
+  bool operator()(std::int64_t value) { return literal(fmt::format_int(value)); }
+  bool operator()(std::uint64_t value) { return literal(fmt::format_int(value)); }
+  bool operator()(double value) {
+    if (!std::isfinite(value)) return false;
+    _json.separate();
+    TextEnd end{_json._text};
+    return rapidjson::Writer<TextEnd>(end).Double(value);
+  }
   bool operator()(Date) { return false; }
   bool operator()(const Data&) { return false; }
   bool operator()(std::string_view text) {
-    Prefix(rapidjson::kStringType);
-    writeText(text);
-    return EndValue(true);
+    _json.text(text);
+    return true;
   }
   bool operator()(const Array& array) {
     if (++_depth > kMaximumValueDepth) return false;
-    StartArray();
+    _json.startArray();
     for (const Value& element : array) {
       if (!write(element)) return false;
     }
     --_depth;
-    return EndArray();
+    _json.endArray();
+    return true;
   }
   bool operator()(const Dictionary& dictionary) {
     if (++_depth > kMaximumValueDepth) return false;
-    StartObject();
+    _json.startObject();
     for (const auto& [key, element] : dictionary) {
-      (*this)(std::string_view(key));
+      _json.key(key);
       if (!write(element)) return false;
     }
     --_depth;
-    return EndObject();
+    _json.endObject();
+    return true;
   }
 
  private:
-  void append(std::string_view text) {
-    if (!text.empty()) std::memcpy(os_->Push(text.size()), text.data(), text.size());
+  bool literal(std::string_view text) {
+    _json.written(text);
+    return true;
   }
+  bool literal(const fmt::format_int& number) { return literal({number.data(), number.size()}); }
 
-  void writeText(std::string_view text) {
-    os_->Put('"');
-    while (!text.empty()) {
-      const std::size_t plain = plainLength(text);
-      append(text.substr(0, plain));
-      text.remove_prefix(plain);
-      if (!text.empty()) text.remove_prefix(writeSpecial(text));
-    }
-    os_->Put('"');
-  }
-
-  /// Writes the first character of `text`, which doesn't stand for itself, and returns how many bytes it has.
-  std::size_t writeSpecial(std::string_view text) {
-    const auto byte = static_cast<unsigned char>(text[0]);
-    if (byte < 0x80) {
-      writeEscape(byte);
-      return 1;
-    }
-    const UTF8Sequence sequence = firstUTF8Sequence(text);
-    append(sequence.wellFormed ? text.substr(0, sequence.length) : kReplacementCharacter);
-    return sequence.length;
-  }
-
-  void writeEscape(unsigned char byte) {
-    switch (byte) {
-      case '"':
-        return append("\\\"");
-      case '\\':
-        return append("\\\\");
-      case '\b':
-        return append("\\b");
-      case '\f':
-        return append("\\f");
-      case '\n':
-        return append("\\n");
-      case '\r':
-        return append("\\r");
-      case '\t':
-        return append("\\t");
-      default:
-        constexpr std::string_view kDigits = "0123456789ABCDEF";
-        append("\\u00");
-        os_->Put(kDigits[byte >> 4]);
-        os_->Put(kDigits[byte & 15]);
-    }
-  }
-
+  JSONText& _json;
   int _depth = 0;
 };
+
+void JSONText::key(std::string_view name) {
+  separate();
+  quote(name);
+  _text += ':';
+  _needsComma = false;
+}
+
+void JSONText::text(std::string_view value) {
+  separate();
+  quote(value);
+}
+
+bool JSONText::value(const Value& value) { return Writer(*this).write(value); }
+
+void JSONText::written(std::string_view json) {
+  separate();
+  _text += json;
+}
+
+void JSONText::start(char bracket) {
+  separate();
+  _text += bracket;
+  _needsComma = false;
+}
+
+void JSONText::end(char bracket) {
+  _text += bracket;
+  _needsComma = true;
+}
+
+/// Before a value, or a key.
+void JSONText::separate() {
+  if (std::exchange(_needsComma, true)) _text += ',';
+}
+
+void JSONText::quote(std::string_view text) {
+  const std::size_t plain = plainLength(text);
+  const std::size_t start = _text.size();
+  _text.append(plain + 2, '"');  // Most texts are plain: one look for room.
+  if (plain > 0) std::memcpy(&_text[start + 1], text.data(), plain);
+  if (plain == text.size()) return;
+  _text.pop_back();
+  text.remove_prefix(plain);
+  while (!text.empty()) {
+    text.remove_prefix(appendSpecial(text));
+    const std::size_t next = plainLength(text);
+    _text += text.substr(0, next);
+    text.remove_prefix(next);
+  }
+  _text += '"';
+}
+
+/// Appends the first character of `text`, which doesn't stand for itself; returns how many bytes it has.
+std::size_t JSONText::appendSpecial(std::string_view text) {
+  const auto byte = static_cast<unsigned char>(text[0]);
+  if (byte < 0x80) {
+    appendEscape(_text, byte);
+    return 1;
+  }
+  const UTF8Sequence sequence = firstUTF8Sequence(text);
+  _text += sequence.wellFormed ? text.substr(0, sequence.length) : kReplacementCharacter;
+  return sequence.length;
+}
+
+namespace {
 
 // Reading
 
@@ -266,10 +313,9 @@ std::string errorText(rapidjson::ParseErrorCode code, std::size_t offset) {
 }  // namespace
 
 std::optional<std::string> jsonFromValue(const Value& value) {
-  JSONBuffer buffer;
-  ValueWriter writer(buffer);
-  if (!writer.write(value)) return std::nullopt;
-  return std::string(buffer.GetString(), buffer.GetSize());
+  JSONText text;
+  if (!text.value(value)) return std::nullopt;
+  return text.take();
 }
 
 JSONResult valueFromJSON(std::string_view text) {

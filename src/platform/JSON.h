@@ -1,6 +1,7 @@
 // Values as JSON text (RFC 8259) and back.
 #pragma once
 
+#include <cstddef>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -8,6 +9,43 @@
 #include "platform/Value.h"
 
 namespace tallyd::platform {
+
+/// A JSON text in the making: compact, with the separators that what comes next needs.
+///
+/// Text that is not UTF-8 gets the replacement character. Threading: one thread at a time.
+class JSONText {
+ public:
+  JSONText() = default;
+  /// @param bytes  how long the text is expected to become.
+  explicit JSONText(std::size_t bytes) { _text.reserve(bytes); }
+
+  void startObject() { start('{'); }
+  void endObject() { end('}'); }
+  void startArray() { start('['); }
+  void endArray() { end(']'); }
+  void key(std::string_view name);  ///< A value must follow.
+  void text(std::string_view value);
+  /// False when the value holds a date, data, a NaN or an infinity, or is nested too deeply; the text is of
+  /// no use then.
+  [[nodiscard]] bool value(const Value& value);
+  /// A value, or a member with its key, that is JSON already.
+  void written(std::string_view json);
+
+  [[nodiscard]] std::string_view view() const { return _text; }
+  [[nodiscard]] std::string take() { return std::move(_text); }
+
+ private:
+  class Writer;
+
+  void start(char bracket);
+  void end(char bracket);
+  void separate();
+  void quote(std::string_view text);
+  [[nodiscard]] std::size_t appendSpecial(std::string_view text);
+
+  std::string _text;
+  bool _needsComma = false;
+};
 
 /// Compact JSON; nothing when the value holds a date, data, a NaN or an infinity. Booleans are true and
 /// false; text that is not UTF-8 gets the replacement character.

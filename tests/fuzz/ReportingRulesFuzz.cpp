@@ -82,15 +82,19 @@ void checkFilters(const Array& filters, const Dictionary& before, const Dictiona
   FUZZ_CHECK(after.size() <= before.size());
 }
 
-void checkPost(Dictionary event) {
+void checkPost(EventFields& event) {
   fakes::FakeLog log;
   sanitizeEventForJSON(event, log);
-  const auto body = postBody({1'763'712'000, 5'000}, "client", {event});
-  FUZZ_CHECK(body.has_value());
-  const auto read = valueFromJSON(*body);
+  JSONText array;
+  array.startArray();
+  appendEvent(array, event);
+  array.endArray();
+  const auto read = valueFromJSON(postBody({1'763'712'000, 5'000}, "client", array.view()));
   FUZZ_CHECK(read.value && read.value->dictionary());
   const Array* events = read.value->dictionary()->array("events");
   FUZZ_CHECK(events && events->size() == 1);
+  const Dictionary* posted = (*events)[0].dictionary();
+  FUZZ_CHECK(posted && posted->size() == event.dictionary().size());
 }
 
 }  // namespace
@@ -125,13 +129,15 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   facts.status = flags % 3;
   facts.sender = "PH";
   EventRecords records;
-  Dictionary event = records.record(payload, facts);
-  FUZZ_CHECK(event.integer("_method") == facts.method);
-  const Dictionary before = event;
+  const EventRecord record = records.record(payload, facts);
+  EventFields event;
+  record.fieldsInto(event);
+  const Dictionary before = event.dictionary();
+  FUZZ_CHECK(before.integer("_method") == facts.method);
   EventFilters compiled;
   compiled.createFiltersFromArray(filters);
   compiled.filterEvent(event);
-  checkFilters(filters, before, event);
+  checkFilters(filters, before, event.dictionary());
   checkPost(event);
   return 0;
 }

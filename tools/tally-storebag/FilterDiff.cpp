@@ -66,10 +66,11 @@ Fate fateOf(const std::string& key, const Case& message, const EventFilters& fil
   Dictionary event{{"_method", std::to_string(message.method)}, {"_status", std::to_string(message.status)}};
   if (!event.contains(key)) event.set(key, kProbe);
   const std::string before(*event.string(key));
-  filters.filterEvent(event);
-  const auto left = event.string(key);
+  EventFields fields(event);
+  filters.filterEvent(fields);
+  const EventField* left = fields.find(key);
   if (!left) return Fate::Removed;
-  return left == TallyBackend::convertIntoSHA256(before) ? Fate::Hashed : Fate::Plain;
+  return left->string() == TallyBackend::convertIntoSHA256(before) ? Fate::Hashed : Fate::Plain;
 }
 
 class FieldDiff {

@@ -57,10 +57,11 @@ std::string fieldFate(const EventFilters& filters, const std::string& key, const
   constexpr std::string_view kProbe = "?";
   Dictionary event{{"_method", std::to_string(message.category)}, {"_status", std::to_string(message.type)}};
   event.set(key, kProbe);
-  filters.filterEvent(event);
-  const auto left = event.string(key);
+  EventFields fields(event);
+  filters.filterEvent(fields);
+  const EventField* left = fields.find(key);
   if (!left) return "removed";
-  return left == TallyBackend::convertIntoSHA256(kProbe) ? "hashed" : "";
+  return left->string() == TallyBackend::convertIntoSHA256(kProbe) ? "hashed" : "";
 }
 
 }  // namespace

@@ -1,7 +1,5 @@
 #include "backends/https-post/EventFilters.h"
 
-#include <algorithm>
-
 #include "backends/TallyBackend.h"
 #include "platform/text/UnicodeText.h"
 
@@ -26,6 +24,20 @@ filterTag compiled(const Dictionary& rule) {
           .key = std::string(rule.string("key").value_or(""))};
 }
 
+std::int64_t numberUnder(std::string_view key, const EventFields& event) {
+  const EventField* field = event.find(key);
+  return field ? field->integer().value_or(0) : 0;
+}
+
+/// A number below `count` by a key's length and first character: the same for ASCII keys that differ only in
+/// case.
+std::size_t shapeOf(std::string_view key, std::size_t count) {
+  constexpr unsigned kCaseBit = 0x20;
+  constexpr std::size_t kSpread = 31;
+  const unsigned first = key.empty() ? 0 : static_cast<unsigned char>(key[0]) | kCaseBit;
+  return (key.size() * kSpread + first) % count;
+}
+
 bool fits(std::int32_t wanted, std::int64_t actual) { return wanted < 0 || wanted == actual; }
 
 }  // namespace
@@ -34,7 +46,7 @@ void EventFilters::createFiltersFromArray(const Array& filters) {
   if (filters.empty()) return;
   _rules.clear();
   _rulesByFoldedKey.clear();
-  _keyLengths.reset();
+  _shapes.reset();
   _rules.reserve(filters.size());
   for (const Value& element : filters) {
     const Dictionary* rule = element.dictionary();
@@ -44,28 +56,28 @@ void EventFilters::createFiltersFromArray(const Array& filters) {
     if (!hasKey) continue;
     const std::string folded = platform::caseFolded(tag.key);
     _rulesByFoldedKey[folded].push_back(_rules.size() - 1);
-    _keyLengths.set(std::min(folded.size(), kCountedLength));
+    _shapes.set(shapeOf(folded, kShapes));
   }
 }
 
-void EventFilters::filterEvent(Dictionary& event) const {
+void EventFilters::filterEvent(EventFields& event) const {
   if (_rulesByFoldedKey.empty()) return;
-  const std::int64_t method = event.integer("_method").value_or(0);
-  const std::int64_t status = event.integer("_status").value_or(0);
-  const Dictionary before = event;
-  for (const auto& [key, value] : before) {
-    const filterTag* rule = ruleFor(key, method, status);
-    if (!rule) continue;
-    if (rule->action == FilterActionRemove) event.remove(key);
+  const std::int64_t method = numberUnder("_method", event);
+  const std::int64_t status = numberUnder("_status", event);
+  event.change([&](EventField& field) {
+    const filterTag* rule = ruleFor(field.key, method, status);
+    if (!rule) return true;
     if (rule->action == FilterActionSHA256) {
-      event.set(key, TallyBackend::convertIntoSHA256(value.string().value_or(value.description())));
+      const auto text = field.string();
+      event.setText(field, TallyBackend::convertIntoSHA256(text ? *text : field.description()));
     }
-  }
+    return rule->action != FilterActionRemove;
+  });
 }
 
 const filterTag* EventFilters::ruleFor(std::string_view key, std::int64_t method, std::int64_t status) const {
-  // Folding leaves the length of ASCII as it is, and most fields have no rule.
-  if (!_keyLengths[std::min(key.size(), kCountedLength)] && platform::isASCII(key)) return nullptr;
+  // Most fields have no rule: no folding for them.
+  if (!_shapes[shapeOf(key, kShapes)] && platform::isASCII(key)) return nullptr;
   const auto found = _rulesByFoldedKey.find(platform::caseFolded(key));
   if (found == _rulesByFoldedKey.end()) return nullptr;
   for (const std::size_t index : found->second) {

@@ -9,6 +9,7 @@
 #include <unordered_map>
 #include <vector>
 
+#include "backends/https-post/EventFields.h"
 #include "platform/Value.h"
 
 namespace tallyd {
@@ -39,7 +40,7 @@ class EventFilters {
   void createFiltersFromArray(const platform::Array& filters);
 
   /// Applies the rules to every field of the event, whose "_method" and "_status" choose among them.
-  void filterEvent(platform::Dictionary& event) const;
+  void filterEvent(EventFields& event) const;
 
   [[nodiscard]] const std::vector<filterTag>& rules() const { return _rules; }
 
@@ -51,8 +52,8 @@ class EventFilters {
   /// Indices into `_rules` by their case-folded key, in the order of the storebag: a field's cost does not
   /// grow with the number of rules for other fields.
   std::unordered_map<std::string, std::vector<std::size_t>> _rulesByFoldedKey;
-  static constexpr std::size_t kCountedLength = 63;  ///< Longer keys count as this long.
-  std::bitset<kCountedLength + 1> _keyLengths;       ///< Lengths in bytes that folded keys have.
+  static constexpr std::size_t kShapes = 256;
+  std::bitset<kShapes> _shapes;  ///< Of the folded keys.
 };
 
 }  // namespace tallyd

@@ -4,27 +4,45 @@
 
 #include <algorithm>
 #include <tuple>
+#include <vector>
+
+#include "platform/JSON.h"
 
 namespace tallyd {
 
 using platform::Dictionary;
-using platform::Value;
+
+/// What the records of a session have in common, in the order of the keys.
+struct EventRecord::Common {
+  /// Where a field's value comes from.
+  enum class Source { Session, Nowhere, SessionID, ClientTime, EventNumber, Method, Status, TimezoneOffset };
+
+  struct Field {
+    std::string_view key;
+    Source source;
+    std::string text{};  ///< Of the session's own fields; `json` is key and text as JSON.
+    std::string json{};
+  };
+
+  std::vector<Field> fields;
+};
 
 namespace {
 
-/// The facts that seldom change within a session.
+/// The facts that seldom change within a session, but for its identifier.
 auto commonFacts(const EventFacts& facts) {
-  return std::tie(facts.sessionStart, facts.sender, facts.clientVersion, facts.sessionID, facts.productFamily,
+  return std::tie(facts.sessionStart, facts.sender, facts.clientVersion, facts.productFamily,
                   facts.productModel, facts.osVersion, facts.build, facts.isInternal,
                   facts.reportVersionMajor, facts.reportVersionMinor);
 }
 
 std::string decimal(std::int64_t number) { return fmt::format_int(number).str(); }
 
-std::size_t placeOf(std::string_view key, const std::vector<Dictionary::Entry>& entries) {
-  const auto found = std::find_if(entries.begin(), entries.end(),
-                                  [key](const Dictionary::Entry& entry) { return entry.key == key; });
-  return static_cast<std::size_t>(found - entries.begin());
+std::string jsonMember(std::string_view key, std::string_view text) {
+  platform::JSONText json;
+  json.key(key);
+  json.text(text);
+  return json.take();
 }
 
 }  // namespace
@@ -34,54 +52,83 @@ std::int64_t truncateToMinute(std::int64_t seconds) {
   return seconds / kMinute * kMinute;
 }
 
-Dictionary EventRecords::record(const std::optional<Dictionary>& payload, const EventFacts& facts) {
+void EventRecord::fieldsInto(EventFields& fields) const {
+  using Source = Common::Source;
+  fields.clear();
+  const std::string_view clientTime = fields.keep(fmt::format("{:.3f}", _clientTime));
+  const auto ownField = [&](const Common::Field& field) -> EventField {
+    switch (field.source) {
+      case Source::SessionID:
+        return {.key = field.key, .value = &_sessionID};
+      case Source::ClientTime:
+        return {.key = field.key, .text = clientTime};
+      case Source::EventNumber:
+        return {.key = field.key, .text = fields.keep(decimal(_eventNumber))};
+      case Source::Method:
+        return {.key = field.key, .text = fields.keep(decimal(_method))};
+      case Source::Status:
+        return {.key = field.key, .text = fields.keep(decimal(_status))};
+      case Source::TimezoneOffset:
+        return {.key = field.key, .value = &_timezoneOffset};
+      default:
+        return {.key = field.key, .text = field.text, .json = field.json};
+    }
+  };
+  const Dictionary::Entry* next = _payload.begin();
+  for (const Common::Field& field : _common->fields) {
+    while (next != _payload.end() && next->key < field.key) {
+      fields.append({.key = next->key, .value = &next->value});
+      ++next;
+    }
+    if (next != _payload.end() && next->key == field.key) ++next;
+    if (field.source != Source::Nowhere) fields.append(ownField(field));
+  }
+  for (; next != _payload.end(); ++next) fields.append({.key = next->key, .value = &next->value});
+}
+
+EventRecord EventRecords::record(const std::optional<Dictionary>& payload, const EventFacts& facts) {
   if (!_prepared || commonFacts(*_prepared) != commonFacts(facts)) prepare(facts);
-  const Value shiftedTime = fmt::format("{:.3f}", _startMinute + (facts.eventTime - facts.sessionStart));
-  std::vector<Dictionary::Entry> entries = _common;
-  entries[_places.clientTime].value = shiftedTime;
-  entries[_places.eventTime].value = shiftedTime;
-  entries[_places.eventNumber].value = decimal(facts.eventNumber);
-  entries[_places.method].value = decimal(facts.method);
-  entries[_places.status].value = decimal(facts.status);
-  entries[_places.timezoneOffset].value = static_cast<std::int64_t>(facts.timezoneOffset.count());
-  Dictionary record = payload.value_or(Dictionary());
-  for (const std::string_view key : _missing) record.remove(key);
-  record.merge(Dictionary(std::move(entries)));
+  if (_sessionID.string() != facts.sessionID) _sessionID = facts.sessionID;
+  EventRecord record;
+  if (payload) record._payload = *payload;
+  record._common = _common;
+  record._sessionID = _sessionID;
+  record._timezoneOffset = static_cast<std::int64_t>(facts.timezoneOffset.count());
+  record._clientTime = _startMinute + (facts.eventTime - facts.sessionStart);
+  record._eventNumber = facts.eventNumber;
+  record._method = facts.method;
+  record._status = facts.status;
   return record;
 }
 
 void EventRecords::prepare(const EventFacts& facts) {
+  using Source = EventRecord::Common::Source;
   const std::int64_t startMinute = truncateToMinute(static_cast<std::int64_t>(facts.sessionStart));
   _startMinute = static_cast<double>(startMinute);
-  _common = {{"_clientTS", nullptr},
-             {"_clientVersion", decimal(facts.clientVersion)},
-             {"_eventNumber", nullptr},
-             {"_internal", facts.isInternal ? "1" : "0"},
-             {"_method", nullptr},
-             {"_reportVers", fmt::format("{}.{}", facts.reportVersionMajor, facts.reportVersionMinor)},
-             {"_sender", facts.sender},
-             {"_sessionID", facts.sessionID},
-             {"_startTS", decimal(startMinute)},
-             {"_status", nullptr},
-             {"_timezoneOffset", nullptr},
-             {"eventTime", nullptr}};
-  _missing.clear();
-  const auto addIfKnown = [this](std::string_view key, const std::optional<std::string_view>& text) {
+  const auto common = std::make_shared<EventRecord::Common>();
+  common->fields = {{"_clientTS", Source::ClientTime}, {"_eventNumber", Source::EventNumber},
+                    {"_method", Source::Method},       {"_sessionID", Source::SessionID},
+                    {"_status", Source::Status},       {"_timezoneOffset", Source::TimezoneOffset},
+                    {"eventTime", Source::ClientTime}};
+  const auto add = [&](std::string_view key, const std::optional<std::string_view>& text) {
     if (text) {
-      _common.push_back({std::string(key), *text});
+      common->fields.push_back({key, Source::Session, std::string(*text), jsonMember(key, *text)});
     } else {
-      _missing.push_back(key);
+      common->fields.push_back({key, Source::Nowhere});
     }
   };
-  addIfKnown("_productFamily", facts.productFamily);
-  addIfKnown("_productModel", facts.productModel);
-  addIfKnown("_osVersion", facts.osVersion);
-  addIfKnown("_build", facts.build);
-  std::sort(_common.begin(), _common.end(),
-            [](const Dictionary::Entry& a, const Dictionary::Entry& b) { return a.key < b.key; });
-  _places = {placeOf("_clientTS", _common),       placeOf("_eventNumber", _common),
-             placeOf("_method", _common),         placeOf("_status", _common),
-             placeOf("_timezoneOffset", _common), placeOf("eventTime", _common)};
+  add("_clientVersion", decimal(facts.clientVersion));
+  add("_internal", facts.isInternal ? "1" : "0");
+  add("_reportVers", fmt::format("{}.{}", facts.reportVersionMajor, facts.reportVersionMinor));
+  add("_sender", facts.sender);
+  add("_startTS", decimal(startMinute));
+  add("_productFamily", facts.productFamily);
+  add("_productModel", facts.productModel);
+  add("_osVersion", facts.osVersion);
+  add("_build", facts.build);
+  std::sort(common->fields.begin(), common->fields.end(),
+            [](const auto& a, const auto& b) { return a.key < b.key; });
+  _common = common;
   remember(facts);
 }
 
@@ -91,7 +138,6 @@ void EventRecords::remember(const EventFacts& facts) {
   std::size_t next = 0;
   const auto keep = [&](std::string_view text) -> std::string_view { return _texts[next++] = text; };
   _prepared->sender = keep(facts.sender);
-  _prepared->sessionID = keep(facts.sessionID);
   for (auto* text :
        {&_prepared->productFamily, &_prepared->productModel, &_prepared->osVersion, &_prepared->build}) {
     if (*text) *text = keep(**text);

@@ -5,13 +5,13 @@
 
 #include <array>
 #include <chrono>
-#include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
-#include <vector>
 
+#include "backends/https-post/EventFields.h"
 #include "platform/Value.h"
 
 namespace tallyd {
@@ -36,6 +36,29 @@ struct EventFacts {
   std::chrono::seconds timezoneOffset{0};
 };
 
+/// The record of one message. It shares its payload with whoever else has it, and what the records of a
+/// session have in common with those.
+class EventRecord {
+ public:
+  /// The payload with the facts set over it; a fact that is missing takes a payload field of its name away.
+  /// What `fields` held before is gone; they refer to this record and keep what they must.
+  void fieldsInto(EventFields& fields) const;
+  void setSessionID(platform::Value sessionID) { _sessionID = std::move(sessionID); }
+
+ private:
+  friend class EventRecords;
+  struct Common;
+
+  platform::Dictionary _payload;
+  std::shared_ptr<const Common> _common;
+  platform::Value _sessionID;
+  platform::Value _timezoneOffset;
+  double _clientTime = 0;
+  std::uint16_t _eventNumber = 0;
+  std::uint16_t _method = 0;
+  std::uint16_t _status = 0;
+};
+
 /// Makes the records of one session. What they have in common is prepared once, and anew when it changes.
 ///
 /// Threading: one thread at a time.
@@ -45,26 +68,19 @@ class EventRecords {
   EventRecords(const EventRecords&) = delete;
   EventRecords& operator=(const EventRecords&) = delete;
 
-  /// The payload with the facts set over it; a fact that is missing takes a payload field of its name away.
   /// Times are shifted so that the session looks as if it had started on a whole minute.
-  [[nodiscard]] platform::Dictionary record(const std::optional<platform::Dictionary>& payload,
-                                            const EventFacts& facts);
+  [[nodiscard]] EventRecord record(const std::optional<platform::Dictionary>& payload,
+                                   const EventFacts& facts);
 
  private:
-  /// Where the entries lie that differ from event to event.
-  struct Places {
-    std::size_t clientTime, eventNumber, method, status, timezoneOffset, eventTime;
-  };
-
   void prepare(const EventFacts& facts);
   void remember(const EventFacts& facts);
 
-  std::array<std::string, 6> _texts;                 ///< What _prepared refers to.
-  std::optional<EventFacts> _prepared;               ///< The facts that _common was made of.
-  std::vector<platform::Dictionary::Entry> _common;  ///< Of all records, in the order of their keys.
-  std::vector<std::string_view> _missing;            ///< Keys of the facts that are missing.
+  std::array<std::string, 5> _texts;    ///< What _prepared refers to.
+  std::optional<EventFacts> _prepared;  ///< The facts that _common was made of.
+  std::shared_ptr<const EventRecord::Common> _common;
+  platform::Value _sessionID;
   double _startMinute = 0;
-  Places _places{};
 };
 
 /// `seconds` cut toward zero to a multiple of 60.

@@ -85,7 +85,7 @@ TallyBackend::Result HTTPSPostBackend::sendMessage(const Payload& payload, const
     _account->dropNew(DropReason::StateOff, 1, numbers);
     return std::nullopt;
   }
-  Dictionary event =
+  EventRecord event =
       createEventDictfromPayload(respCode == kSessionStopRespCode ? stopMessagePayload(payload) : payload,
                                  timestamp, method, respCode, eventID);
   asl_log(_platform.log, LogLevel::Debug, "Tally (sendMessage): {:d}, {:d}, {:d}", _state, _batchEvents,
@@ -99,10 +99,10 @@ TallyBackend::Result HTTPSPostBackend::sendMessage(const Payload& payload, const
     _account->dropNew(DropReason::ConsentWithdrawn, 1, numbers);
     return std::nullopt;
   }
-  Events events{std::move(event)};
   _account->start();
-  prepareEventArrayForMessage(events);
-  const auto document = createMessageForPost(std::move(events));
+  Events events;
+  events.push_back(std::move(event));
+  const auto document = documentOf(events);
   return document ? postJsonMessage(*document) : std::nullopt;
 }
 
@@ -118,7 +118,7 @@ void HTTPSPostBackend::setCorrelatedSessionID(const std::string& correlatedSessi
   setCombinedSessionIDString(correlatedSessionID);
   if (!_batchedEvents) return;
   const Value sessionID(correlatedSessionID);
-  for (Dictionary& event : *_batchedEvents) event.set("_sessionID", sessionID);
+  for (EventRecord& event : *_batchedEvents) event.setSessionID(sessionID);
 }
 
 void HTTPSPostBackend::updateState() {
@@ -218,11 +218,9 @@ TallyBackend::Payload HTTPSPostBackend::stopMessagePayload(const Payload& payloa
   return stop;
 }
 
-platform::Dictionary HTTPSPostBackend::createEventDictfromPayload(const Payload& payload,
-                                                                  const timeval& timestamp,
-                                                                  std::uint16_t method,
-                                                                  std::uint16_t respCode,
-                                                                  std::uint16_t eventID) {
+EventRecord HTTPSPostBackend::createEventDictfromPayload(const Payload& payload, const timeval& timestamp,
+                                                         std::uint16_t method, std::uint16_t respCode,
+                                                         std::uint16_t eventID) {
   const std::string sessionID = _combinedSessionIDString.value_or(std::to_string(_sessionID));
   return _records.record(payload, {.sessionStart = _startTimeStamp,
                                    .sender = codeForClientType(_compType),
@@ -242,9 +240,9 @@ platform::Dictionary HTTPSPostBackend::createEventDictfromPayload(const Payload&
                                    .timezoneOffset = _platform.locale.offsetFromGMT(_platform.clock.now())});
 }
 
-void HTTPSPostBackend::batchEvent(Dictionary event, const MessageNumbers& numbers) {
+void HTTPSPostBackend::batchEvent(EventRecord event, const MessageNumbers& numbers) {
   if (!_batchedEvents) _batchedEvents.emplace();
-  const std::string method(event.string("_method").value_or(""));
+  const std::uint16_t method = numbers.method;
   std::int32_t& count = _eventMethodCounts[method];
   if (count > _eventThreshold) {
     asl_log(_platform.log, LogLevel::Debug, "HTTPSPostBackend: Dropping batched event ({})", method);
@@ -277,25 +275,32 @@ std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::takeBatchForPost() {
     return std::nullopt;
   }
   _account->startHeld(events.size());
-  prepareEventArrayForMessage(events);
-  return createMessageForPost(std::move(events));
+  return documentOf(events);
 }
 
-void HTTPSPostBackend::prepareEventArrayForMessage(Events& events) const {
-  for (Dictionary& event : events) {
-    if (_userInfoDict) event.merge(*_userInfoDict);
-    _filters.filterEvent(event);
-  }
-}
-
-std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::createMessageForPost(Events events) const {
-  const std::size_t count = events.size();
+std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::documentOf(const Events& events) const {
   try {
-    return documentOf(std::move(events));
+    return createMessageForPost(prepareEventArrayForMessage(events), events.size());
   } catch (const std::bad_alloc&) {
-    dropForMemory(count);
+    dropForMemory(events.size());
     return std::nullopt;
   }
+}
+
+std::string HTTPSPostBackend::prepareEventArrayForMessage(const Events& events) const {
+  constexpr std::size_t kUsualEventBytes = 1024;
+  platform::JSONText array(events.size() * kUsualEventBytes);
+  EventFields fields;
+  array.startArray();
+  for (const EventRecord& event : events) {
+    event.fieldsInto(fields);
+    if (_userInfoDict) fields.merge(*_userInfoDict);
+    _filters.filterEvent(fields);
+    sanitizeEventForJSON(fields, _platform.log);
+    appendEvent(array, fields);
+  }
+  array.endArray();
+  return array.take();
 }
 
 void HTTPSPostBackend::dropForMemory(std::size_t events) const {
@@ -304,18 +309,14 @@ void HTTPSPostBackend::dropForMemory(std::size_t events) const {
   _account->drop(DropReason::OutOfMemory, events);
 }
 
-std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::documentOf(Events events) const {
+HTTPSPostBackend::Document HTTPSPostBackend::createMessageForPost(std::string_view eventArray,
+                                                                  std::size_t count) const {
   const timeval now = _platform.clock.timeOfDay();
-  for (Dictionary& event : events) sanitizeEventForJSON(event, _platform.log);
   auto clientIdentifier = Tally(_platform).getPersistentIdentifierForDNU(_dnuType == DNUTypeConsent);
   if (_extrasOnInternal != 0 && _isInternal) clientIdentifier = _udid;
-  const std::size_t count = events.size();
-  auto json = postBody(now, clientIdentifier, std::move(events));
-  if (!json || !clientIdentifier) {
-    _account->drop(json ? DropReason::NoClientIdentifier : DropReason::NotPostable, count);
-  }
-  if (!json) return std::nullopt;
-  return Document{std::move(*json), clientIdentifier ? count : 0};
+  Document document{postBody(now, clientIdentifier, eventArray), clientIdentifier ? count : 0};
+  if (!clientIdentifier) _account->drop(DropReason::NoClientIdentifier, count);
+  return document;
 }
 
 TallyBackend::Result HTTPSPostBackend::postJsonMessage(const Document& document) const {

@@ -63,7 +63,7 @@ class HTTPSPostBackend final : public TallyBackend {
   [[nodiscard]] std::size_t batchedEventCount() const { return _batchedEvents ? _batchedEvents->size() : 0; }
 
  private:
-  using Events = std::vector<Dictionary>;
+  using Events = std::vector<EventRecord>;
 
   /// A document that is ready to go.
   struct Document {
@@ -80,19 +80,20 @@ class HTTPSPostBackend final : public TallyBackend {
   void takePostURL(const std::string& storebagURL);
 
   Payload stopMessagePayload(const Payload& payload) const;
-  Dictionary createEventDictfromPayload(const Payload& payload, const timeval& timestamp,
-                                        std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID);
-  void batchEvent(Dictionary event, const MessageNumbers& numbers);
+  EventRecord createEventDictfromPayload(const Payload& payload, const timeval& timestamp,
+                                         std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID);
+  void batchEvent(EventRecord event, const MessageNumbers& numbers);
   [[nodiscard]] bool hasRequiredUserInfo() const { return !_requireUserInfo || _userInfoDict; }
   [[nodiscard]] bool isConsentWithdrawn();
   void logWithdrawal(std::size_t events) const;
   /// Prepares and takes the batch away; what is left is no batch. Nothing without a document, and when
   /// consent is withdrawn.
   std::optional<Document> takeBatchForPost();
-  void prepareEventArrayForMessage(Events& events) const;
   /// Takes events that are booked as being in flight.
-  std::optional<Document> createMessageForPost(Events events) const;
-  [[nodiscard]] std::optional<Document> documentOf(Events events) const;
+  std::optional<Document> documentOf(const Events& events) const;
+  /// The events as a JSON array: each with the user info, filtered, and what is not fit for JSON left out.
+  [[nodiscard]] std::string prepareEventArrayForMessage(const Events& events) const;
+  [[nodiscard]] Document createMessageForPost(std::string_view eventArray, std::size_t count) const;
   void dropForMemory(std::size_t events) const;  ///< Of those in flight.
   Result postJsonMessage(const Document& document) const;
   [[nodiscard]] platform::HTTPRequest requestFor(const std::string& json) const;
@@ -112,8 +113,7 @@ class HTTPSPostBackend final : public TallyBackend {
   std::int32_t _eventThreshold = kDefaultEventThreshold;
   std::int32_t _extrasOnInternal = 0;
   std::optional<platform::Value> _samplingThreshold;
-  std::map<std::string, std::int32_t, std::less<>>
-      _eventMethodCounts;  ///< Events of each method in the batch.
+  std::map<std::uint16_t, std::int32_t> _eventMethodCounts;  ///< Events of each method in the batch.
 };
 
 }  // namespace tallyd

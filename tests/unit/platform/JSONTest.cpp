@@ -80,6 +80,30 @@ TEST(JSONTest, WritesNestingUpToItsBoundOnly) {
       jsonFromValue(Array{nestedArrays(kMaximumValueDepth - 1), nestedArrays(kMaximumValueDepth - 1)}));
 }
 
+TEST(JSONTextTest, SeparatesWhatIsWrittenPieceByPiece) {
+  JSONText json;
+  json.startObject();
+  json.key("list");
+  json.startArray();
+  EXPECT_TRUE(json.value(1));
+  EXPECT_TRUE(json.value(Dictionary{{"a", true}, {"b", Value()}}));
+  json.text("x\"y");
+  json.startArray();
+  json.endArray();
+  json.endArray();
+  json.written(R"("ready":"made")");
+  json.key("last");
+  json.written("[1,2]");
+  json.endObject();
+  EXPECT_EQ(json.view(), R"({"list":[1,{"a":true,"b":null},"x\"y",[]],"ready":"made","last":[1,2]})");
+}
+
+TEST(JSONTextTest, SaysThatAValueCannotBeWritten) {
+  JSONText json(100);
+  EXPECT_FALSE(json.value(Date{1}));
+  EXPECT_FALSE(json.value(std::numeric_limits<double>::infinity()));
+}
+
 TEST(JSONTest, ReadsEveryKind) {
   const JSONResult result = valueFromJSON(
       R"( {"n":null,"t":true,"f":false,"i":-7,"u":18446744073709551615,"r":1.5e3,"s":"a\u00e9\ud83d\ude00\n","a":[1,[]],"o":{}} )");

@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include "backends/https-post/PostBody.h"
+
 namespace tallyd {
 namespace {
 
@@ -27,6 +29,12 @@ EventFacts facts() {
           .timezoneOffset = std::chrono::seconds(3600)};
 }
 
+Dictionary fieldsOf(const EventRecord& record) {
+  EventFields fields;
+  record.fieldsInto(fields);
+  return fields.dictionary();
+}
+
 struct ShiftedTimes {
   std::string start;
   std::string event;
@@ -36,29 +44,30 @@ ShiftedTimes timesOf(double sessionStart, double eventTime) {
   EventFacts given = facts();
   given.sessionStart = sessionStart;
   given.eventTime = eventTime;
-  const Dictionary record = EventRecords().record(std::nullopt, given);
+  const Dictionary record = fieldsOf(EventRecords().record(std::nullopt, given));
   EXPECT_EQ(record.string("eventTime"), record.string("_clientTS"));
   return {std::string(record.string("_startTS").value_or("")),
           std::string(record.string("_clientTS").value_or(""))};
 }
 
 TEST(EventRecordTest, HoldsEveryFactUnderItsKeyAsTextAndTheTimeZoneAsNumber) {
-  EXPECT_EQ(EventRecords().record(std::nullopt, facts()), (Dictionary{{"_startTS", "1768478400"},
-                                                            {"_sender", "DH"},
-                                                            {"_clientVersion", "12"},
-                                                            {"_sessionID", "77"},
-                                                            {"_eventNumber", "5"},
-                                                            {"_method", "3"},
-                                                            {"_status", "4"},
-                                                            {"_clientTS", "1768478401.250"},
-                                                            {"eventTime", "1768478401.250"},
-                                                            {"_productFamily", "Kasten"},
-                                                            {"_productModel", "Kasten3,1"},
-                                                            {"_osVersion", "12.4"},
-                                                            {"_build", "12D500"},
-                                                            {"_internal", "0"},
-                                                            {"_reportVers", "7.42"},
-                                                            {"_timezoneOffset", 3600}}));
+  EXPECT_EQ(fieldsOf(EventRecords().record(std::nullopt, facts())),
+            (Dictionary{{"_startTS", "1768478400"},
+                        {"_sender", "DH"},
+                        {"_clientVersion", "12"},
+                        {"_sessionID", "77"},
+                        {"_eventNumber", "5"},
+                        {"_method", "3"},
+                        {"_status", "4"},
+                        {"_clientTS", "1768478401.250"},
+                        {"eventTime", "1768478401.250"},
+                        {"_productFamily", "Kasten"},
+                        {"_productModel", "Kasten3,1"},
+                        {"_osVersion", "12.4"},
+                        {"_build", "12D500"},
+                        {"_internal", "0"},
+                        {"_reportVers", "7.42"},
+                        {"_timezoneOffset", 3600}}));
 }
 
 TEST(EventRecordTest, PutsASessionStartedAt12_00_59_500AtTheWholeMinuteAndItsEventsAsFarBehindItAsTheyWere) {
@@ -116,7 +125,7 @@ TEST(EventRecordTest, KeepsPayloadFieldsAndOverwritesThoseOfItsOwnNames) {
                            {"eventTime", 1},
                            {"_sender", "other"},
                            {"list", platform::Array{1}}};
-  const Dictionary record = EventRecords().record(payload, facts());
+  const Dictionary record = fieldsOf(EventRecords().record(payload, facts()));
   EXPECT_EQ(record.integer("bitrate"), 500);
   EXPECT_EQ(*record.find("list"), Value(platform::Array{1}));
   EXPECT_EQ(record.string("_method"), "3");
@@ -130,7 +139,7 @@ TEST(EventRecordTest, LeavesMissingDeviceFactsOutAlsoWhereThePayloadHasThem) {
   given.productFamily = given.productModel = given.osVersion = given.build = std::nullopt;
   const Dictionary payload{
       {"_productFamily", "a"}, {"_productModel", "b"}, {"_osVersion", "c"}, {"_build", "d"}};
-  const Dictionary record = EventRecords().record(payload, given);
+  const Dictionary record = fieldsOf(EventRecords().record(payload, given));
   for (const char* key : {"_productFamily", "_productModel", "_osVersion", "_build"}) {
     EXPECT_FALSE(record.contains(key)) << key;
   }
@@ -142,7 +151,7 @@ TEST(EventRecordTest, WritesTheLargestNumbersWhole) {
   given.clientVersion = given.eventNumber = given.method = given.status = 65'535;
   given.reportVersionMajor = given.reportVersionMinor = 255;
   given.isInternal = true;
-  const Dictionary record = EventRecords().record(std::nullopt, given);
+  const Dictionary record = fieldsOf(EventRecords().record(std::nullopt, given));
   for (const char* key : {"_clientVersion", "_eventNumber", "_method", "_status"}) {
     EXPECT_EQ(record.string(key), "65535") << key;
   }
@@ -153,7 +162,7 @@ TEST(EventRecordTest, WritesTheLargestNumbersWhole) {
 TEST(EventRecordTest, GivesTheTimeZoneAsANumberThatMayBeNegative) {
   EventFacts given = facts();
   given.timezoneOffset = std::chrono::seconds(-34'200);
-  const Dictionary record = EventRecords().record(std::nullopt, given);
+  const Dictionary record = fieldsOf(EventRecords().record(std::nullopt, given));
   ASSERT_TRUE(record.contains("_timezoneOffset"));
   EXPECT_TRUE(record.find("_timezoneOffset")->isInteger());
   EXPECT_EQ(record.integer("_timezoneOffset"), -34'200);
@@ -163,7 +172,7 @@ TEST(EventRecordTest, FollowsFactsThatChangeFromEventToEvent) {
   EventRecords records;
   EventFacts given = facts();
   const auto sameAsAlone = [&](const std::optional<Dictionary>& payload) {
-    return records.record(payload, given) == EventRecords().record(payload, given);
+    return fieldsOf(records.record(payload, given)) == fieldsOf(EventRecords().record(payload, given));
   };
   EXPECT_TRUE(sameAsAlone(std::nullopt));
   given.sessionID = "P.77";
@@ -179,15 +188,48 @@ TEST(EventRecordTest, FollowsFactsThatChangeFromEventToEvent) {
   EXPECT_TRUE(sameAsAlone(std::nullopt));
 }
 
+TEST(EventRecordTest, LeavesARecordAsItIsWhenLaterFactsDiffer) {
+  EventRecords records;
+  EventFacts given = facts();
+  const EventRecord first = records.record(Dictionary{{"a", 1}}, given);
+  const Dictionary before = fieldsOf(first);
+  given.sessionID = "other";
+  given.build = std::nullopt;
+  given.sessionStart += 600;
+  (void)records.record(std::nullopt, given);
+  EXPECT_EQ(fieldsOf(first), before);
+}
+
+TEST(EventRecordTest, TakesAnotherSessionIDLater) {
+  EventRecords records;
+  EventRecord renamed = records.record(std::nullopt, facts());
+  const EventRecord other = records.record(std::nullopt, facts());
+  renamed.setSessionID("parent.77");
+  EXPECT_EQ(fieldsOf(renamed).string("_sessionID"), "parent.77");
+  EXPECT_EQ(fieldsOf(other).string("_sessionID"), "77");
+}
+
+TEST(EventRecordTest, WritesEveryFieldAsItsValueWouldBeWritten) {
+  EventFacts given = facts();
+  given.productFamily = "Kas\"ten";
+  given.osVersion = "12\xFF";
+  EventFields fields;
+  const EventRecord record = EventRecords().record(Dictionary{{"zeta", 1}, {"Alpha", "x"}}, given);
+  record.fieldsInto(fields);
+  platform::JSONText json;
+  appendEvent(json, fields);
+  EXPECT_EQ(json.view(), platform::jsonFromValue(fields.dictionary()));
+}
+
 TEST(EventRecordTest, KeepsTextsOfItsOwnForTheNextComparison) {
   EventRecords records;
   EventFacts given = facts();
   std::string session = "first";
   given.sessionID = session;
-  EXPECT_EQ(records.record(std::nullopt, given).string("_sessionID"), "first");
+  EXPECT_EQ(fieldsOf(records.record(std::nullopt, given)).string("_sessionID"), "first");
   session = "other";  // In the same place, and of the same length.
   given.sessionID = session;
-  EXPECT_EQ(records.record(std::nullopt, given).string("_sessionID"), "other");
+  EXPECT_EQ(fieldsOf(records.record(std::nullopt, given)).string("_sessionID"), "other");
 }
 
 }  // namespace

@@ -23,15 +23,13 @@ FakeLog::Line removal(std::string_view key, std::string_view value) {
                                  ", value: " + std::string(value)};
 }
 
-Dictionary sanitized(Dictionary event, FakeLog& log) {
-  sanitizeEventForJSON(event, log);
-  return event;
+Dictionary sanitized(const Dictionary& event, FakeLog& log) {
+  EventFields fields(event);
+  sanitizeEventForJSON(fields, log);
+  return fields.dictionary();
 }
 
-std::string postTimeAt(timeval time) {
-  const auto body = postBody(time, std::nullopt, {});
-  return body.value_or("nothing");
-}
+std::string postTimeAt(timeval time) { return postBody(time, std::nullopt, "[]"); }
 
 TEST(SanitizeEventForJSONTest, KeepsStringsAndFiniteNumbersAsTheyAre) {
   FakeLog log;
@@ -81,17 +79,30 @@ TEST(PostBodyTest, PadsTheMillisecondsWithBlanks) {
 }
 
 TEST(PostBodyTest, HoldsTimeIdentifierAndEventsCompactly) {
-  EXPECT_EQ(postBody({1, 100'000}, "me", {Dictionary{{"n", 1}}, Dictionary{{"t", "x"}}}),
+  EXPECT_EQ(postBody({1, 100'000}, "me", R"([{"n":1},{"t":"x"}])"),
             R"({"clientId":"me","events":[{"n":1},{"t":"x"}],"postTime":"1.100"})");
-  EXPECT_EQ(postBody({1, 100'000}, "", {}), R"({"clientId":"","events":[],"postTime":"1.100"})");
+  EXPECT_EQ(postBody({1, 100'000}, "", "[]"), R"({"clientId":"","events":[],"postTime":"1.100"})");
 }
 
 TEST(PostBodyTest, EndsBehindThePostTimeWithoutAClientIdentifier) {
-  EXPECT_EQ(postBody({1, 100'000}, std::nullopt, {Dictionary{{"n", 1}}}), R"({"postTime":"1.100"})");
+  EXPECT_EQ(postBody({1, 100'000}, std::nullopt, R"([{"n":1}])"), R"({"postTime":"1.100"})");
 }
 
-TEST(PostBodyTest, IsNothingWhenAnEventCannotBeWritten) {
-  EXPECT_EQ(postBody({1, 0}, "me", {Dictionary{{"d", Date{0}}}}), std::nullopt);
+TEST(PostBodyTest, WritesTheClientIdentifierAsJSON) {
+  EXPECT_EQ(postBody({1, 0}, "a\"b", "[]"), R"({"clientId":"a\"b","events":[],"postTime":"1.  0"})");
+}
+
+TEST(AppendEventTest, WritesValuesTextsAndWhatIsJSONAlready) {
+  const Value number = 1.5;
+  EventFields fields;
+  fields.append({.key = "a", .value = &number});
+  fields.append({.key = "b", .text = "two\n"});
+  fields.append({.key = "c", .text = "three", .json = R"("c":"three")"});
+  platform::JSONText json;
+  appendEvent(json, fields);
+  fields.clear();
+  appendEvent(json, fields);
+  EXPECT_EQ(json.view(), R"({"a":1.5,"b":"two\n","c":"three"},{})");
 }
 
 }  // namespace
