@@ -1,8 +1,11 @@
-// Reference-counted storage of values: one word a reference, and a safe answer to "am I the only one?".
+// Reference-counted storage of values: one word a reference.
 #pragma once
 
 #include <atomic>
 #include <cstddef>
+#include <cstring>
+#include <new>
+#include <string_view>
 #include <utility>
 
 namespace tallyd::platform {
@@ -54,6 +57,44 @@ class Shared {
     std::atomic<std::size_t> count{1};
   };
   Box* _box = nullptr;
+};
+
+/// An immutable text, counted like a Shared, in one piece of memory with its count.
+///
+/// Threading: as Shared's.
+class SharedText {
+ public:
+  explicit SharedText(std::string_view text)
+      : _box(static_cast<Box*>(::operator new(sizeof(Box) + text.size()))) {
+    new (_box) Box{{1}, text.size()};
+    if (!text.empty()) std::memcpy(bytes(), text.data(), text.size());
+  }
+  SharedText(const SharedText& other) noexcept : _box(other._box) {
+    if (_box) _box->count.fetch_add(1, std::memory_order_relaxed);
+  }
+  SharedText(SharedText&& other) noexcept : _box(std::exchange(other._box, nullptr)) {}
+  SharedText& operator=(SharedText other) noexcept {
+    std::swap(_box, other._box);
+    return *this;
+  }
+  ~SharedText() {
+    if (_box && _box->count.fetch_sub(1, std::memory_order_acq_rel) == 1) ::operator delete(_box);
+  }
+
+  [[nodiscard]] std::string_view view() const noexcept {
+    return _box ? std::string_view(bytes(), _box->size) : std::string_view();
+  }
+  bool operator==(const SharedText& other) const noexcept { return view() == other.view(); }
+
+ private:
+  struct Box {
+    std::atomic<std::size_t> count;
+    std::size_t size;
+  };
+  /// Behind the box.
+  [[nodiscard]] char* bytes() const noexcept { return reinterpret_cast<char*>(_box + 1); }
+
+  Box* _box;
 };
 
 }  // namespace tallyd::platform

@@ -116,10 +116,6 @@ std::int64_t leadingInteger(std::string_view text) {
 Array::Array(std::initializer_list<Value> elements) : Array(std::vector<Value>(elements)) {}
 Array::Array(std::vector<Value> elements) : _elements(std::move(elements)) {}
 
-std::size_t Array::size() const { return _elements ? _elements->size() : 0; }
-const Value& Array::operator[](std::size_t index) const { return (*_elements)[index]; }
-const Value* Array::begin() const { return _elements ? _elements->data() : nullptr; }
-const Value* Array::end() const { return begin() + size(); }
 void Array::append(Value value) { _elements.unique().push_back(std::move(value)); }
 void Array::replace(std::size_t index, Value value) { _elements.unique()[index] = std::move(value); }
 bool Array::operator==(const Array& other) const {
@@ -160,10 +156,6 @@ std::vector<Dictionary::Entry> sortedEntries(std::vector<Dictionary::Entry> entr
 
 Dictionary::Dictionary(std::initializer_list<Entry> entries) : Dictionary(std::vector<Entry>(entries)) {}
 Dictionary::Dictionary(std::vector<Entry> entries) : _entries(sortedEntries(std::move(entries))) {}
-
-std::size_t Dictionary::size() const { return _entries ? _entries->size() : 0; }
-const Dictionary::Entry* Dictionary::begin() const { return _entries ? _entries->data() : nullptr; }
-const Dictionary::Entry* Dictionary::end() const { return begin() + size(); }
 
 const Value* Dictionary::find(std::string_view key) const {
   const Entry* found = std::lower_bound(begin(), end(), key, kByKey);
@@ -266,8 +258,8 @@ Value::Value(std::uint64_t value) {
 }
 
 std::optional<std::string_view> Value::string() const {
-  const auto* text = std::get_if<String>(&_value);
-  return text ? std::optional<std::string_view>(**text) : std::nullopt;
+  const auto* text = std::get_if<SharedText>(&_value);
+  return text ? std::optional(text->view()) : std::nullopt;
 }
 
 std::optional<Date> Value::date() const {
@@ -309,12 +301,7 @@ bool Value::operator==(const Value& other) const {
   return std::visit(
       [&other](const auto& mine) {
         using Kind = std::decay_t<decltype(mine)>;
-        const auto& theirs = std::get<Kind>(other._value);
-        if constexpr (std::is_same_v<Kind, String>) {
-          return *mine == *theirs;
-        } else {
-          return mine == theirs;
-        }
+        return mine == std::get<Kind>(other._value);
       },
       _value);
 }

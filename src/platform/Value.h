@@ -119,16 +119,16 @@ class Value {
   Value(std::uint64_t value);  ///< Becomes a signed integer when it fits.
   Value(long long value) : _value(static_cast<std::int64_t>(value)) {}
   Value(double value) : _value(value) {}
-  Value(const char* value) : Value(std::string(value)) {}
-  Value(std::string_view value) : Value(std::string(value)) {}
-  Value(std::string value) : _value(String(std::move(value))) {}
+  Value(const char* value) : Value(std::string_view(value)) {}
+  Value(std::string_view value) : _value(SharedText(value)) {}
+  Value(const std::string& value) : Value(std::string_view(value)) {}
   Value(Date value) : _value(value) {}
   Value(Data value) : _value(std::move(value)) {}
   Value(Array value) : _value(std::move(value)) {}
   Value(Dictionary value) : _value(std::move(value)) {}
 
   [[nodiscard]] bool isNull() const { return std::holds_alternative<std::monostate>(_value); }
-  [[nodiscard]] bool isString() const { return std::holds_alternative<String>(_value); }
+  [[nodiscard]] bool isString() const { return std::holds_alternative<SharedText>(_value); }
   [[nodiscard]] bool isBoolean() const { return std::holds_alternative<bool>(_value); }
   [[nodiscard]] bool isInteger() const {
     return std::holds_alternative<std::int64_t>(_value) || std::holds_alternative<std::uint64_t>(_value);
@@ -165,8 +165,8 @@ class Value {
   decltype(auto) visit(Visitor&& visitor) const {
     return std::visit(
         [&visitor](const auto& value) -> decltype(auto) {
-          if constexpr (std::is_same_v<std::decay_t<decltype(value)>, String>) {
-            return visitor(std::string_view(*value));
+          if constexpr (std::is_same_v<std::decay_t<decltype(value)>, SharedText>) {
+            return visitor(value.view());
           } else {
             return visitor(value);
           }
@@ -177,8 +177,7 @@ class Value {
   bool operator==(const Value& other) const;
 
  private:
-  using String = Shared<std::string>;
-  std::variant<std::monostate, bool, std::int64_t, std::uint64_t, double, Date, String, Data, Array,
+  std::variant<std::monostate, bool, std::int64_t, std::uint64_t, double, Date, SharedText, Data, Array,
                Dictionary>
       _value;
 };
@@ -188,6 +187,15 @@ struct Dictionary::Entry {
   Value value;
   bool operator==(const Entry&) const = default;
 };
+
+inline std::size_t Array::size() const { return _elements ? _elements->size() : 0; }
+inline const Value& Array::operator[](std::size_t index) const { return (*_elements)[index]; }
+inline const Value* Array::begin() const { return _elements ? _elements->data() : nullptr; }
+inline const Value* Array::end() const { return begin() + size(); }
+
+inline std::size_t Dictionary::size() const { return _entries ? _entries->size() : 0; }
+inline const Dictionary::Entry* Dictionary::begin() const { return _entries ? _entries->data() : nullptr; }
+inline const Dictionary::Entry* Dictionary::end() const { return begin() + size(); }
 
 /// The decimal number at the start of `text`, blanks before it passed over; 0 without one; clamped to 64
 /// bits.
