@@ -18,6 +18,7 @@
 #include "framework/TallyLogging.h"
 #include "platform/ipc/DBusListener.h"
 #include "platform/sandbox/LinuxSandbox.h"
+#include "platform/system/ProcessMemory.h"
 #include "platform/system/SystemClock.h"
 
 namespace {
@@ -142,6 +143,7 @@ int serve(const tallyd::DaemonOptions& options, const tallyd::platform::Root& ro
   listener->setDelegate(agent);
   listener->resume();
   asl_log(log, LogLevel::Info, "Listener resumes with sandbox, start loop.");
+  tallyd::platform::releaseStartPages();
   sd_notify(0, "READY=1\nSTATUS=Listening");
   if (!options.drain) runMainLoop();
 
@@ -163,6 +165,7 @@ int main(int argc, char** argv) {
   std::signal(SIGPIPE, SIG_IGN);
   if (options.drain) holdStopSignal();
   raiseDescriptorLimit();
+  tallyd::platform::keepFreedMemory();
   const tallyd::platform::SystemClock clock;
   const tallyd::platform::Root root(options.root);
   const auto log = tallyd::platform::makeLog(options.logDestination, options.logLevel, clock);
