@@ -20,7 +20,7 @@ class Reader {
 
   /// @param type  one complete type.
   Value read(std::string_view type) {
-    if (_valuesLeft-- == 0) throw Malformed{"too many values"};
+    if (_valuesLeft-- == 0) throwMalformed("too many values");
     switch (type[0]) {
       case 'v':
         return readVariant();
@@ -31,7 +31,7 @@ class Reader {
       case 's':
         return Value(_bytes.text());
       case 'g':
-        if (!_bytes.signature().empty()) throw Malformed{"a signature is no value"};
+        if (!_bytes.signature().empty()) throwMalformed("a signature is no value");
         return {};
       case 'b':
         return readBoolean();
@@ -51,7 +51,7 @@ class Reader {
   class Level {
    public:
     explicit Level(int& depth) : _depth(depth) {
-      if (++_depth > kMaximumContainerDepth) throw Malformed{"nested too deeply"};
+      if (++_depth > kMaximumContainerDepth) throwMalformed("nested too deeply");
     }
     ~Level() { --_depth; }
     Level(const Level&) = delete;
@@ -84,14 +84,14 @@ class Reader {
 
   Value readBoolean() {
     const auto number = _bytes.number<std::uint32_t>();
-    if (number > 1) throw Malformed{"a boolean that is neither 0 nor 1"};
+    if (number > 1) throwMalformed("a boolean that is neither 0 nor 1");
     return Value(number == 1);
   }
 
   Value readVariant() {
     const Level level(_depth);
     const std::string_view inner = _bytes.signature();
-    if (!isOneCompleteType(inner)) throw Malformed{"a variant of no single type"};
+    if (!isOneCompleteType(inner)) throwMalformed("a variant of no single type");
     const bool outermost = !_inVariant;
     _inVariant = true;
     Value value = read(inner);
@@ -102,13 +102,13 @@ class Reader {
   /// Where the array ends whose elements come next.
   std::size_t enterArray(char element) {
     const auto size = _bytes.number<std::uint32_t>();
-    if (size > kMaximumArrayBytes) throw Malformed{"an array that is too long"};
+    if (size > kMaximumArrayBytes) throwMalformed("an array that is too long");
     _bytes.align(alignmentOf(element));
     return _bytes.position() + size;
   }
 
   bool isWithin(std::size_t end) const {
-    if (_bytes.position() > end) throw Malformed{"an element that reaches beyond its array"};
+    if (_bytes.position() > end) throwMalformed("an element that reaches beyond its array");
     return _bytes.position() < end;
   }
 
@@ -124,7 +124,7 @@ class Reader {
 
   Value readDictionary(std::string_view entry, std::size_t end) {
     constexpr std::size_t kUsualSize = 12;
-    if (entry[1] != 's') throw Malformed{"a dictionary's keys must be strings"};
+    if (entry[1] != 's') throwMalformed("a dictionary's keys must be strings");
     const std::string_view valueType = entry.substr(2, entry.size() - 3);
     std::vector<Dictionary::Entry> entries;
     if (isWithin(end)) entries.reserve(kUsualSize);
@@ -137,14 +137,14 @@ class Reader {
   }
 
   Value readDate(std::string_view type) {
-    if (type != "(d)") throw Malformed{"a structure other than (d) is no value"};
+    if (type != "(d)") throwMalformed("a structure other than (d) is no value");
     return Value(Date{_bytes.number<double>()});
   }
 
   Value readDescriptor() {
-    if (_inVariant) throw Malformed{"a descriptor is no value"};
+    if (_inVariant) throwMalformed("a descriptor is no value");
     const auto index = _bytes.number<std::uint32_t>();
-    if (index >= _came.size() || !_came[index]) throw Malformed{"a descriptor that did not come"};
+    if (index >= _came.size() || !_came[index]) throwMalformed("a descriptor that did not come");
     _used.push_back(std::move(_came[index]));
     return {};
   }

@@ -24,6 +24,8 @@ std::size_t plainPrefix(std::string_view text) {
 
 }  // namespace
 
+void throwMalformed(const char* reason) { throw Malformed{reason}; }
+
 bool ByteReader::isCarriableText(std::string_view text) {
   text.remove_prefix(plainPrefix(text));
   while (!text.empty()) {

@@ -14,6 +14,8 @@ namespace tallyd::platform::dbus {
 struct Malformed {
   std::string reason;
 };
+/// Throws it; by itself so that the readers stay small where all is well.
+[[noreturn]] void throwMalformed(const char* reason);
 
 /// A place in marshalled bytes. Everything is checked against their end; what does not fit throws Malformed.
 ///
@@ -30,12 +32,12 @@ class ByteReader {
   /// Passes over padding, which must be zeros.
   void align(std::size_t boundary) {
     while ((_position & (boundary - 1)) != 0) {
-      if (bytes(1)[0] != '\0') throw Malformed{"padding that is not zero"};
+      if (bytes(1)[0] != '\0') throwMalformed("padding that is not zero");
     }
   }
 
   std::string_view bytes(std::size_t count) {
-    if (count > _bytes.size() - _position) throw Malformed{"cut off"};
+    if (count > _bytes.size() - _position) throwMalformed("cut off");
     const auto taken = _bytes.substr(_position, count);
     _position += count;
     return taken;
@@ -65,12 +67,12 @@ class ByteReader {
  private:
   std::string_view terminatedBytes(std::size_t length) {
     const auto content = bytes(length);
-    if (bytes(1)[0] != '\0') throw Malformed{"a text without its end"};
+    if (bytes(1)[0] != '\0') throwMalformed("a text without its end");
     return content;
   }
   std::string_view terminated(std::size_t length) {
     const auto content = terminatedBytes(length);
-    if (!isCarriableText(content)) throw Malformed{"a text that is no UTF-8, or holds a NUL"};
+    if (!isCarriableText(content)) throwMalformed("a text that is no UTF-8, or holds a NUL");
     return content;
   }
   static bool isCarriableText(std::string_view text);

@@ -1,6 +1,7 @@
 #include "platform/dbus/Message.h"
 
 #include <algorithm>
+#include <array>
 
 #include "platform/dbus/ByteReader.h"
 #include "platform/dbus/Signature.h"
@@ -29,11 +30,22 @@ enum HeaderField : std::uint8_t {
 std::endian byteOrderOf(char mark) {
   if (mark == 'l') return std::endian::little;
   if (mark == 'B') return std::endian::big;
-  throw Malformed{"an unknown byte order"};
+  throwMalformed("an unknown byte order");
 }
 
-bool isNameStart(char c) { return (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || c == '_'; }
-bool isNamePart(char c) { return isNameStart(c) || (c >= '0' && c <= '9'); }
+constexpr bool isNameStart(char c) { return (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || c == '_'; }
+
+/// By byte: whether it may stand in a name, though perhaps not at its start.
+constexpr auto kNameParts = [] {
+  std::array<bool, 256> parts{};
+  for (unsigned byte = 0; byte < parts.size(); ++byte) {
+    const auto c = static_cast<char>(byte);
+    parts[byte] = isNameStart(c) || (c >= '0' && c <= '9');
+  }
+  return parts;
+}();
+
+bool isNamePart(char c) { return kNameParts[static_cast<unsigned char>(c)]; }
 
 bool isMember(std::string_view name) {
   return !name.empty() && name.size() <= kMaximumNameBytes && isNameStart(name[0]) &&
@@ -61,7 +73,7 @@ bool isPath(std::string_view path) {
 }
 
 void require(bool condition, const char* reason) {
-  if (!condition) throw Malformed{reason};
+  if (!condition) throwMalformed(reason);
 }
 
 void readField(ByteReader& bytes, std::uint8_t code, MessageFields& fields) {
