@@ -73,4 +73,15 @@ inline std::string withBrokenUTF8Replaced(std::string_view text) {
   return result;
 }
 
+/// The first whole characters of `text`, which is UTF-8, in at most `maximumBytes`.
+inline std::string_view wholeUTF8Characters(std::string_view text, std::size_t maximumBytes) {
+  if (text.size() <= maximumBytes) return text;
+  const auto isContinuation = [text](std::size_t i) {
+    return (static_cast<std::uint8_t>(text[i]) & 0xC0) == 0x80;
+  };
+  std::size_t end = maximumBytes;
+  while (end > 0 && isContinuation(end)) --end;
+  return text.substr(0, end);
+}
+
 }  // namespace tallyd::platform

@@ -142,18 +142,17 @@ TallyBackend::Result DashboardBackend::sendMessage(const Payload& payload, const
                             .eventID = eventID,
                             .reliableUDP = _sender->reliableUDP(),
                             .usingProfile = _usingProfile};
-  std::shared_ptr<const Datagram> datagram;
+  _account->start();
   try {
-    datagram = std::make_shared<const Datagram>(facts, payload);
+    auto datagram = std::make_shared<const Datagram>(facts, payload);
+    Result line = writeLocalLog(datagram->bytes());
+    _sender->send(std::move(datagram));
+    return line;
   } catch (const std::bad_alloc&) {
     asl_log(_platform.log, LogLevel::Error, "Tally (DashboardBackend): can't malloc.");
-    _account->dropNew(DropReason::OutOfMemory, 1, {{method, eventID}});
+    _account->drop(DropReason::OutOfMemory, 1, {{method, eventID}});
     return std::nullopt;
   }
-  Result line = writeLocalLog(datagram->bytes());
-  _account->start();
-  _sender->send(std::move(datagram));
-  return line;
 }
 
 bool DashboardBackend::uploadLogData(const platform::Array& logData) {

@@ -128,10 +128,20 @@ void DatagramSender::drop() {
 void DatagramSender::tryToSendMsg(const Datagram& datagram) {
   const bool isSent = sendAllBytes(datagram.bytes());
   if (isSent && _delivery == Delivery::FireAndForget) return _account->finish();
-  UDPPacketToSend packet(datagram.bytes(), datagram.eventID());
-  if (isSent) packet.setState(PacketStateWaiting);
-  _messageQueue.append(std::move(packet));
+  try {
+    keep(datagram, isSent ? PacketStateWaiting : PacketStateNotSent);
+  } catch (const std::bad_alloc&) {
+    asl_log(_log, LogLevel::Error, "Tally (DashboardBackend): can't malloc.");
+    const std::uint16_t method = datagramNumber16(datagram.bytes(), DatagramMethod);
+    _account->drop(DropReason::OutOfMemory, 1, {{method, datagram.eventID()}});
+  }
   if (!_timer) _messageQueue.drop(DropReason::CleanUp);  // Nothing looks after it any more.
+}
+
+void DatagramSender::keep(const Datagram& datagram, PacketState state) {
+  UDPPacketToSend packet(datagram.bytes(), datagram.eventID());
+  packet.setState(state);
+  _messageQueue.append(std::move(packet));
 }
 
 bool DatagramSender::sendAllBytes(std::string_view bytes) const {

@@ -59,7 +59,7 @@ class DatagramSender : public std::enable_shared_from_this<DatagramSender> {
 
   /// Before the first datagram.
   void setAccount(std::shared_ptr<Account> account);
-  /// Takes a datagram that is booked as being in flight.
+  /// Takes a datagram that is booked as being in flight. Throws std::bad_alloc, and has not taken it then.
   void send(std::shared_ptr<const Datagram> datagram);
   /// Ends at once when nothing waits, else when nothing waits any more, or after a tick and 9.5 s.
   void cleanup();
@@ -70,6 +70,7 @@ class DatagramSender : public std::enable_shared_from_this<DatagramSender> {
   enum CleanupState : int { CleanupNotAsked = 0, CleanupRequested = 1, CleanupLastResortScheduled = 2 };
 
   void tryToSendMsg(const Datagram& datagram);
+  void keep(const Datagram& datagram, PacketState state);
   [[nodiscard]] bool sendAllBytes(std::string_view bytes) const;
   void showOnTap(std::string_view bytes) const;
   void myPeriodicTask();

@@ -53,8 +53,8 @@ Verdict check(UDPPacketToSend& packet, Delivery delivery, const MessageQueue::Se
 }  // namespace
 
 void MessageQueue::append(UDPPacketToSend packet) {
-  if (_account && packet.state() == PacketStateNotSent) _account->holdBack();
   _packets.push_back(std::move(packet));
+  if (_account && _packets.back().state() == PacketStateNotSent) _account->holdBack();
   if (_packets.size() <= kMaximumPackets) return;
   bookDrop(_packets.front(), DropReason::QueueFull);
   _packets.erase(_packets.begin());

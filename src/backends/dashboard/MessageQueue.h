@@ -38,7 +38,7 @@ class MessageQueue {
   /// While the queue is empty.
   void setAccount(std::shared_ptr<Account> account) { _account = std::move(account); }
 
-  /// Takes a datagram that is booked as being in flight.
+  /// Takes a datagram that is booked as being in flight. Throws std::bad_alloc, and has not taken it then.
   void append(UDPPacketToSend packet);
   /// Removes the oldest datagram of this event, if there is one.
   void acknowledge(std::uint16_t eventNumber);

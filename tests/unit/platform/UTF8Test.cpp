@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <vector>
+
 namespace tallyd::platform {
 namespace {
 
@@ -49,6 +51,14 @@ TEST(UTF8Test, AppendsTheReplacementCharacterForSurrogatesAndNumbersTooLarge) {
   appendUTF8(text, 0xDFFF);
   appendUTF8(text, 0x110000);
   EXPECT_EQ(text, "\uFFFD\uFFFD\uFFFD");
+}
+
+TEST(UTF8Test, CutsBetweenTwoCharacters) {
+  const std::string text = "aé€😀";
+  const std::vector<std::string> cuts{"", "a", "a", "aé", "aé", "aé", "aé€", "aé€", "aé€", "aé€", text, text};
+  for (std::size_t most = 0; most < cuts.size(); ++most) {
+    EXPECT_EQ(wholeUTF8Characters(text, most), cuts[most]) << most;
+  }
 }
 
 }  // namespace

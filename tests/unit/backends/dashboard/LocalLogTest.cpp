@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include "backends/dashboard/Datagram.h"
+#include "platform/UTF8.h"
 
 namespace tallyd {
 namespace {
@@ -89,8 +90,31 @@ TEST(LocalLogTest, ReplacesALetterThatTheDatagramsEndCuts) {
 TEST(LocalLogTest, IsAtMost1151BytesLong) {
   const std::string datagram = std::string(Datagram(facts(), std::nullopt).bytes()) + std::string(2000, 'x');
   EXPECT_EQ(writeLocalLog(datagram).size(), 1151U);
-  // Every real datagram's line is shorter.
+  // The line of a device whose ID is UTF-8 is shorter.
   EXPECT_LT(lineFor(facts(), {{"k", std::string(2000, 'x')}}).size(), 1151U);
+}
+
+TEST(LocalLogTest, IsAtMost1151BytesLongThoughReplacingMakesItLonger) {
+  DatagramFacts one = facts();
+  const std::string broken(kDatagramDeviceIDBytes, '\xFF');
+  one.udid = broken;
+  std::string replaced;
+  for (std::size_t i = 0; i < broken.size(); ++i) replaced += platform::kReplacementCharacter;
+  const std::string line = lineFor(one, {{"k", std::string(2000, 'x')}});
+  EXPECT_EQ(line.size(), 1151U);
+  EXPECT_TRUE(line.starts_with("1000.020 " + replaced + " 127.0.0.1 VT "));
+  EXPECT_TRUE(line.ends_with("xx"));
+}
+
+TEST(LocalLogTest, LeavesOutALetterThatDoesNotFitWhole) {
+  const std::string start(Datagram(facts(), std::nullopt).bytes());
+  const std::size_t room = 1151 - writeLocalLog(start).size();
+  for (std::size_t cut = 1; cut < 4; ++cut) {
+    const std::string text(room - cut, 'x');
+    EXPECT_EQ(writeLocalLog(start + text + "😀"), writeLocalLog(start + text)) << cut;
+  }
+  const std::string text(room - 4, 'x');
+  EXPECT_TRUE(writeLocalLog(start + text + "😀y").ends_with("x😀"));
 }
 
 }  // namespace
