@@ -59,4 +59,10 @@ grep -q 'not expected: --no-such-option$' "$scratch/options.log" || {
 }
 drain=$(grep -o -- '--drain [0-9]*' "$service" | cut -d' ' -f2)
 patience=$(sed -n 's/^TimeoutStopSec=//p' "$service")
+# A dashboard's datagram that nobody acknowledges is given up a tick and a last resort after its session's end.
+milliseconds_of() {
+  sed -n "s/^  static constexpr Milliseconds $1{\([0-9]*\)};$/\1/p" "$source_folder/src/backends/dashboard/DatagramSender.h"
+}
+settled=$(($(milliseconds_of kDefaultPeriod) + $(milliseconds_of kLastResortDelay)))
+((settled > 0 && drain * 1000 > settled)) || fail "the service drains for $drain s, and a datagram may wait for $settled ms"
 ((patience > drain)) || fail "the service is killed after $patience s, and may drain for $drain s"
