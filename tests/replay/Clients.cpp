@@ -32,6 +32,9 @@ void Clients::disconnect(int client, Ending ending) {
   if (ending == Ending::Broken) found->second->interrupt();
   found->second->invalidate();
   _connections.erase(found);
+  _world.surroundings().isSessionEnding = true;
+  _world.settle();
+  _world.surroundings().isSessionEnding = false;
 }
 
 void Clients::disconnectAll() {
@@ -73,11 +76,13 @@ void Clients::make(const Step& step, const Send& send) {
 }
 void Clients::make(const Step& step, const SendOnce& once) {
   ++_world.surroundings().received.messagesOffered;
+  _world.surroundings().isOneShotCall = true;
   const bool isIdentified = once.sessionInfo && once.sessionInfo->contains(kTallySessionInfoSessionID);
   call(step, "SendMessageWithSessionInfo",
        {optional(once.sessionInfo), optional(once.userInfo), unsigned{once.message.category},
         unsigned{once.message.type}, optional(once.message.payload)},
        isIdentified ? Answers::One : Answers::MayBeMissing);
+  _world.surroundings().isOneShotCall = false;
 }
 void Clients::make(const Step& step, const Flush&) { call(step, "FlushMessages", {}); }
 

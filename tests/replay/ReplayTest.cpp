@@ -66,6 +66,33 @@ TEST(ReplayTest, WaitsAfterEachFailedFetchHoweverOftenAClientStarts) {
   EXPECT_EQ(outcome.received.fetchesFailed, 8U);
 }
 
+TEST(ReplayTest, LetsNoDashboardOutliveItsSessionForLongThoughNothingIsAcknowledged) {
+  constexpr hours kLength{1};
+  constexpr seconds kBetweenSteps{1};
+  Scenario day{.seed = 1, .length = kLength, .isInternalDevice = false, .steps = {}};
+  seconds at{0};
+  const auto then = [&](int client, Happening happening) {
+    day.steps.push_back({at += kBetweenSteps, client, std::move(happening)});
+  };
+  then(0, ChangeWeather{{.acknowledgementIsLost = 1}});
+  std::uint64_t records = 0;
+  for (const int clientType : {5, 7, 8, 10, 11}) {  // Those whose dashboards ask for acknowledgements.
+    const platform::Dictionary sessionInfo{{"SessionID", clientType}, {"ClientType", clientType}};
+    then(clientType, Connect{});
+    then(clientType, SendOnce{sessionInfo, std::nullopt, {1, 1, std::nullopt}});
+    then(clientType, Configure{sessionInfo, std::nullopt});
+    then(clientType, Start{});
+    then(clientType, Send{2, 1, std::nullopt});
+    then(clientType, Disconnect{Ending::Clean});
+    records += 4;  // Those of start and stop, too.
+  }
+  const Outcome outcome = simulate(day);
+  EXPECT_EQ(outcome.violationCount, 0U) << violationsOf(outcome, 1, kLength);
+  EXPECT_EQ(outcome.received.reliableDatagrams, records);
+  EXPECT_EQ(outcome.received.acknowledged, 0U);
+  EXPECT_EQ(outcome.dropped.at("clean-up"), records);
+}
+
 TEST(ReplayTest, LosesNothingOnItsWayInFineWeather) {
   const Outcome outcome = simulate(makeScenario(5, hours(12)));
   EXPECT_EQ(outcome.violationCount, 0U) << violationsOf(outcome, 5, hours(12));

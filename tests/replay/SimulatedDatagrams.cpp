@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <deque>
 #include <map>
+#include <optional>
 #include <set>
 #include <string>
 
@@ -25,6 +26,8 @@ constexpr std::size_t kMostWaiting = 50;
 constexpr int kMostTransmissions = 5;
 /// The least time from each transmission to the next, in ticks. The first counts from between two ticks.
 constexpr std::array kTicksBefore{1, 3, 5, 9};
+/// A session's end leaves its dashboard a tick and this to hear what was not acknowledged.
+constexpr milliseconds kLastResort{9'500};
 
 /// An acknowledgement, or what looks like one: the daemon reads the event ID alone.
 std::string acknowledgement(std::uint16_t eventID) {
@@ -67,12 +70,14 @@ struct Inbox {
 class SimulatedDatagrams::Socket : public platform::DatagramSocket {
  public:
   Socket(Surroundings& world, std::shared_ptr<platform::SerialQueue> network, int number)
-      : _world(world), _network(std::move(network)), _number(number) {
+      : _world(world), _network(std::move(network)), _number(number), _isOneShot(world.isOneShotCall) {
     ++_world.received.openSockets;
   }
   ~Socket() override {
     --_world.received.openSockets;
     _world.trace.write("socket", "{} closed", _number);
+    if (_closedBy && _world.queues.now() > *_closedBy)
+      _world.violated(fmt::format("socket {} outlived its session's clean-up", _number));
   }
 
   [[nodiscard]] int bindToAnyPort() override { return fails() ? EADDRINUSE : 0; }
@@ -85,6 +90,8 @@ class SimulatedDatagrams::Socket : public platform::DatagramSocket {
     const std::uint16_t eventID = datagramNumber16(bytes, DatagramEventID);
     Datagram& datagram = _datagrams[eventID];
     if (!datagram.acknowledged) _waiting.insert(eventID);
+    if (!_closedBy && (_isOneShot || _world.isSessionEnding))
+      _closedBy = _world.queues.now() + dashboardPeriod(_port) + kLastResort;
     _wasFull = _wasFull || _waiting.size() > kMostWaiting;
     const bool taken = !_world.draws.chance(_world.weather.datagramIsNotTaken);
     _world.trace.write("datagram", "{}:{} event {} {}{}", _number, _port, eventID, taken ? "" : "not taken ",
@@ -166,11 +173,13 @@ class SimulatedDatagrams::Socket : public platform::DatagramSocket {
   Surroundings& _world;
   const std::shared_ptr<platform::SerialQueue> _network;
   const int _number;
+  const bool _isOneShot;
   const std::shared_ptr<Inbox> _inbox = std::make_shared<Inbox>();
   std::uint16_t _port = 0;
   std::map<std::uint16_t, Datagram> _datagrams;
-  std::set<std::uint16_t> _waiting;  ///< Given to the network, and not heard of again.
-  bool _wasFull = false;             ///< More may have waited than the daemon keeps.
+  std::set<std::uint16_t> _waiting;       ///< Given to the network, and not heard of again.
+  bool _wasFull = false;                  ///< More may have waited than the daemon keeps.
+  std::optional<milliseconds> _closedBy;  ///< From the last message of a session on.
 };
 
 std::unique_ptr<platform::DatagramSocket> SimulatedDatagrams::makeSocket() {

@@ -44,6 +44,8 @@ struct Surroundings {
   Received received;
   Violations violations;
   std::uint64_t callsWaiting = 0;  ///< Clients' calls in which time passes at the moment.
+  bool isOneShotCall = false;      ///< Sockets that are made now are for one message.
+  bool isSessionEnding = false;    ///< What is sent now is a session's last record.
   int edition = 0;                 ///< Of the storebags that the servers give out.
   /// Lets time pass within a call that waits: everything else goes on meanwhile.
   std::function<void(std::chrono::milliseconds)> elapse;
