@@ -40,6 +40,14 @@ std::string storebagURL(const Platform& platform, std::optional<std::string_view
                      frameworkVersion);
 }
 
+/// Says that what came is hardly a storebag; it is read all the same.
+void warnOfStatus(const Platform& platform, const std::string& url, int status) {
+  constexpr int kLeastSuccess = 200;
+  constexpr int kMostSuccess = 299;  // RFC 9110, section 15.3.
+  if (status >= kLeastSuccess && status <= kMostSuccess) return;
+  asl_log(platform.log, LogLevel::Warning, "Storebag server answers status {} for {}", status, url);
+}
+
 platform::HTTPResult requestStorebag(const Platform& platform, const std::string& url) {
   asl_log(platform.log, LogLevel::Debug, "Storebag Server URL: {}", url);
   platform::HTTPRequest request;
@@ -50,6 +58,8 @@ platform::HTTPResult requestStorebag(const Platform& platform, const std::string
   if (result.error) {
     asl_log(platform.log, LogLevel::Critical, "Error resolving with lookup server {}", url);
     asl_log(platform.log, LogLevel::Critical, "sendSynchronousRequest error {}", *result.error);
+  } else if (result.response) {
+    warnOfStatus(platform, url, result.response->status);
   }
   return result;
 }

@@ -29,6 +29,13 @@ class StorebagFailureTest : public StorebagFixture {
   std::string signatureOf(std::string_view bytes) const {
     return platform::base64Encoded(server.signature(bytes));
   }
+  void serveStatus(int status, std::string body) {
+    fake.http.answer = [status, body = std::move(body)](const platform::HTTPRequest&) {
+      auto result = fakes::FakeHTTPClient::ok(body);
+      result.response->status = status;
+      return result;
+    };
+  }
   void expectOnlyFetchLine() { EXPECT_EQ(linesOfFailure(), Lines{couldNotFetch}); }
   void expectRefusedSignature() {
     const Lines lines = linesOfFailure();
@@ -81,6 +88,28 @@ TEST_F(StorebagFailureTest, ABodyThatIsNoPropertyListAlsoLacksItsSignature) {
     EXPECT_GT(lines[0].text.size(), std::string_view("propertyListWithData error ").size());
     EXPECT_EQ(lines[1], critical("Signature is missing"));
     EXPECT_EQ(lines[2], couldNotFetch);
+  }
+}
+
+TEST_F(StorebagFailureTest, TheStatusOfAnErrorPageIsLoggedWithTheURLFirst) {
+  for (const int status : {199, 300, 304, 404, 503}) {
+    serveStatus(status, "<html>");
+    const Lines lines = linesOfFailure();
+    ASSERT_EQ(lines.size(), 4U) << status;
+    EXPECT_EQ(lines[0],
+              warning(fmt::format("Storebag server answers status {} for {}", status, kPlayhallURL)));
+    EXPECT_TRUE(lines[1].text.starts_with("propertyListWithData error ")) << lines[1];
+    EXPECT_EQ(lines[2], critical("Signature is missing"));
+    EXPECT_EQ(lines[3], couldNotFetch);
+  }
+}
+
+TEST_F(StorebagFailureTest, ASuccessfulStatusIsNotLogged) {
+  for (const int status : {200, 204, 299}) {
+    serveStatus(status, "<html>");
+    const Lines lines = linesOfFailure();
+    ASSERT_EQ(lines.size(), 3U) << status;
+    EXPECT_TRUE(lines[0].text.starts_with("propertyListWithData error ")) << lines[0];
   }
 }
 

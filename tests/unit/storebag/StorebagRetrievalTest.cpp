@@ -101,13 +101,17 @@ TEST_F(StorebagRetrievalTest, ACacheControlWithoutMaxAgeGivesADay) {
   EXPECT_EQ(fetchStorebagForClientType(platform, 5).maxAgeSeconds, 86'400);
 }
 
-TEST_F(StorebagRetrievalTest, AStatusOtherThan200IsNoError) {
+TEST_F(StorebagRetrievalTest, AStatusOtherThan200IsNoErrorButAWarning) {
   fake.http.answer = [body = server.envelope(bag())](const platform::HTTPRequest&) {
     auto result = fakes::FakeHTTPClient::ok(body);
     result.response->status = 503;
     return result;
   };
   EXPECT_EQ(fetchStorebagForClientType(platform, 5).storebag, section("release"));
+  EXPECT_EQ(fake.log.lines(),
+            (Lines{debug(std::string("Storebag Server URL: ") + kPlayhallURL),
+                   warning(std::string("Storebag server answers status 503 for ") + kPlayhallURL),
+                   info("Environment type 4")}));
 }
 
 TEST_F(StorebagRetrievalTest, EnvelopeAndBagMayBeBinaryPropertyLists) {
