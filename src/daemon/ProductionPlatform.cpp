@@ -25,7 +25,8 @@ constexpr std::string_view kFrameworkBundle = "/usr/share/tally/Tally.framework"
 struct ProductionPlatform::Services {
   Services(const platform::Root& root, platform::Log& log, const platform::Clock& clock,
            platform::Sandbox& sandbox, unsigned retryPosts)
-      : curl(root, queues, log),
+      : queues(platform::AsioQueues::defaultThreadCount(), &log),
+        curl(root, queues, log),
         http(withRetries(retryPosts, clock, log)),
         preferences(root, log),
         defaults(root, log),

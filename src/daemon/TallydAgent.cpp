@@ -1,6 +1,7 @@
 #include "daemon/TallydAgent.h"
 
 #include <algorithm>
+#include <new>
 
 #include "framework/ClientSessionInterface.h"
 #include "framework/TallyKeys.h"
@@ -64,8 +65,22 @@ bool TallydAgent::shouldAcceptNewConnection(const std::shared_ptr<platform::Serv
   asl_log(_platform.log, LogLevel::Debug, "Accepting new XPC connection {}, {}({}) connections.",
           connection->description(), sessions, groups);
   _ledger->connectionAccepted();
-  const auto session =
-      std::make_shared<TallydSession>(*this, _platform, _messageLog, _newBackend, _ledger->openBook());
+  std::shared_ptr<TallydSession> session;
+  try {
+    session =
+        std::make_shared<TallydSession>(*this, _platform, _messageLog, _newBackend, _ledger->openBook());
+    serve(session, connection);
+    return true;
+  } catch (const std::bad_alloc&) {
+    asl_log(_platform.log, LogLevel::Critical, "No memory for a new connection");
+    if (session) forget(*session);
+    _ledger->connectionEnded();
+    return false;
+  }
+}
+
+void TallydAgent::serve(const std::shared_ptr<TallydSession>& session,
+                        const std::shared_ptr<platform::ServiceConnection>& connection) {
   connection->setExportedInterface(clientSessionInterface());
   connection->setExportedObject(std::make_shared<ClientSessionExport>(session, _platform.sandbox));
   {
@@ -78,7 +93,13 @@ bool TallydAgent::shouldAcceptNewConnection(const std::shared_ptr<platform::Serv
   });
   connection->setInvalidationHandler([this, session] { connectionInvalidated(session); });
   connection->resume();
-  return true;
+}
+
+/// The caller holds the session: no reference that goes here is the last.
+void TallydAgent::forget(const TallydSession& session) {
+  const std::lock_guard lock(_mutex);
+  removeFrom(_sessionList, session);
+  _connections.erase(&session);
 }
 
 void TallydAgent::endSessions() {

@@ -41,6 +41,7 @@ class TallydAgent final : public platform::ListenerDelegate, public TallydSessio
                        const AgentOptions& options = {});
   ~TallydAgent() override;
 
+  /// False when there is no memory for a session; nothing is kept of the connection then.
   bool shouldAcceptNewConnection(const std::shared_ptr<platform::ServiceConnection>& connection) override;
 
   /// Ends every connection, and with it its session, as if the client had left. Returns at once.
@@ -65,6 +66,9 @@ class TallydAgent final : public platform::ListenerDelegate, public TallydSessio
 
   std::pair<std::size_t, std::size_t> counts();  ///< Of sessions and of groups.
   Group findParent(const TallydSession& session, const std::string& key, std::int64_t parentHierarchy);
+  void serve(const std::shared_ptr<TallydSession>& session,
+             const std::shared_ptr<platform::ServiceConnection>& connection);
+  void forget(const TallydSession& session);
   void connectionInvalidated(const std::shared_ptr<TallydSession>& session);
 
   const platform::Platform& _platform;

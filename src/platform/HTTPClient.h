@@ -64,12 +64,15 @@ class HTTPClient {
 
   virtual ~HTTPClient() = default;
 
-  /// Blocks until the request is done; marks the wait as a blocking call.
+  /// Blocks until the request is done; marks the wait as a blocking call. A request for which memory runs out
+  /// ends in an error like any other.
   [[nodiscard]] virtual HTTPResult sendSynchronousRequest(const HTTPRequest& request) = 0;
 
   /// Takes the request over and returns at once; `completion` runs on `queue`, exactly once. The bodies of
-  /// unfinished requests are bounded: past the bound the request fails through its completion. The response's
-  /// body is dropped.
+  /// unfinished requests are bounded: past the bound the request fails through its completion, and so it does
+  /// when memory runs out on its way. The response's body is dropped.
+  ///
+  /// Throws std::bad_alloc when the request can't even be taken over: the completion does not run then.
   virtual void sendAsynchronousRequest(HTTPRequest request, std::shared_ptr<SerialQueue> queue,
                                        Completion completion) = 0;
 };

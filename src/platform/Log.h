@@ -41,13 +41,14 @@ class Log {
   std::atomic<int> _highestLevel;
 };
 
-/// Formats one line and writes it; costs a comparison when no destination takes the level.
+/// Formats one line and writes it. A line for which there is no memory is lost.
+void writeLogLine(Log& log, LogLevel level, fmt::string_view format, fmt::format_args arguments);
+
+/// The same; costs a comparison when no destination takes the level.
 template <class... Arguments>
 void asl_log(Log& log, LogLevel level, fmt::format_string<Arguments...> format, Arguments&&... arguments) {
   if (!log.takes(level)) return;
-  fmt::memory_buffer line;
-  fmt::vformat_to(std::back_inserter(line), format, fmt::make_format_args(arguments...));
-  log.write(level, std::string_view(line.data(), line.size()));
+  writeLogLine(log, level, format, fmt::make_format_args(arguments...));
 }
 
 }  // namespace tallyd::platform

@@ -23,6 +23,10 @@ class Source {
 
 /// Runs work one piece at a time, in the order in which it was given. Holds only what is queued, no thread.
 ///
+/// Work is to see to its own exceptions: one that leaves a piece of work ends that piece, or the process, as
+/// the implementation says; a source whose handler throws is called again at its next event. What takes work
+/// throws std::bad_alloc when there is no memory to keep it, and has not taken it then.
+///
 /// Threading: every operation may be called from any thread, also from the queue's own work. The queue lives
 /// as long as anyone holds it or work is queued on it.
 class SerialQueue {

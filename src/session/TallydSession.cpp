@@ -53,16 +53,38 @@ TallydSession::TallydSession(TallydSessionDelegate& sessionDelegate, const platf
 
 TallydSession::~TallydSession() {
   asl_log(_platform.log, LogLevel::Debug, "TallydSession dealloc: {}", sessionID());
+  const auto backends = _backends.copy();
+  atEnd("stop record", [this, &backends] { sendStopRecord(backends.get()); });
+  if (backends) {
+    for (const auto& [name, backend] : *backends) atEnd("flush", [this, &each = *backend] { flush(each); });
+    for (const auto& [name, backend] : *backends) atEnd("clean-up", [&each = *backend] { each.cleanup(); });
+  } else {
+    asl_log(_platform.log, LogLevel::Debug, "No backends available to send message");
+  }
+  _backends.set(nullptr);  // They refer to the device ID, which goes with the members.
+}
+
+template <class Step>
+void TallydSession::atEnd(std::string_view what, const Step& step) const {
+  try {
+    step();
+  } catch (const std::exception& exception) {
+    asl_log(_platform.log, LogLevel::Critical, "TallydSession: {} of session {} left out: {}", what,
+            sessionID(), exception.what());
+  }
+}
+
+void TallydSession::sendStopRecord(const BackendSet* backends) {
   const timeval now = _platform.clock.timeOfDay();
   Dictionary record;
   if (const auto version = _sessionDelegate.storebagVersionForSession(*this))
     record.set("StorebagVersion", *version);
-  internalSendMessage(record, now, kInternalMethod, kSessionStop);
-  flushMessages();
-  if (const auto backends = _backends.copy()) {
-    for (const auto& [name, backend] : *backends) backend->cleanup();
+  if (!backends) return;
+  for (const auto& [name, backend] : *backends) {
+    atEnd("stop record", [this, &each = *backend, &record, &now] {
+      sendInternally(each, record, now, kInternalMethod, kSessionStop);
+    });
   }
-  _backends.set(nullptr);  // They refer to the device ID, which goes with the members.
 }
 
 void TallydSession::setSessionInfo(const Info& sessionInfo, const Info& userInfo, Names frameworksToCheck,

@@ -106,6 +106,13 @@ class TallydSession : public std::enable_shared_from_this<TallydSession> {
   void describeInBook() const;
   bool userInfoChanged(const Dictionary& userInfo) const;
   Info startRecordPayload() const;
+  void sendInternally(TallyBackend& backend, const Info& payload, const timeval& timestamp,
+                      std::uint16_t method, std::uint16_t respCode);
+  Result flush(TallyBackend& backend);
+  void sendStopRecord(const BackendSet* backends);
+  /// The end of a session is nobody's call: what throws is left out, after a line in the log.
+  template <class Step>
+  void atEnd(std::string_view what, const Step& step) const;
 
   const platform::Platform& _platform;
   MessageLog& _messageLog;

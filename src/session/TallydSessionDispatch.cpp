@@ -64,12 +64,15 @@ void TallydSession::internalSendMessage(const Info& payload, const timeval& time
                                         std::uint16_t respCode) {
   const auto backends = _backends.copy();
   if (!backends) return;
-  for (const auto& [name, backend] : *backends) {
-    writeResult(_messageLog, *backend, "internalSendMessage",
-                backend->sendMessage(payload, timestamp, method, respCode));
-    asl_log(_platform.log, LogLevel::Debug, "Sent internal message (method:{} respCode:{})", method,
-            respCode);
-  }
+  for (const auto& [name, backend] : *backends)
+    sendInternally(*backend, payload, timestamp, method, respCode);
+}
+
+void TallydSession::sendInternally(TallyBackend& backend, const Info& payload, const timeval& timestamp,
+                                   std::uint16_t method, std::uint16_t respCode) {
+  writeResult(_messageLog, backend, "internalSendMessage",
+              backend.sendMessage(payload, timestamp, method, respCode));
+  asl_log(_platform.log, LogLevel::Debug, "Sent internal message (method:{} respCode:{})", method, respCode);
 }
 
 TallydSession::Result TallydSession::flushMessages() {
@@ -79,12 +82,14 @@ TallydSession::Result TallydSession::flushMessages() {
     return std::nullopt;
   }
   Result chosen;
-  for (const auto& [name, backend] : *backends) {
-    auto result = backend->flushMessages();
-    writeResult(_messageLog, *backend, "flushMessages", result);
-    applyPrecedence(chosen, *backend, std::move(result));
-  }
+  for (const auto& [name, backend] : *backends) applyPrecedence(chosen, *backend, flush(*backend));
   return chosen;
+}
+
+TallydSession::Result TallydSession::flush(TallyBackend& backend) {
+  auto result = backend.flushMessages();
+  writeResult(_messageLog, backend, "flushMessages", result);
+  return result;
 }
 
 void TallydSession::uploadFileWithURL(const std::string& url, const std::string& extensionToken,

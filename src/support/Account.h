@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <memory>
 #include <mutex>
+#include <new>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -94,13 +95,18 @@ class Account {
     return _tap && _tap->isListening() ? _tap.get() : nullptr;
   }
   /// Shows a line about this account's owner; `describe` adds to it and is called only if somebody listens.
+  /// A line for which there is no memory counts as missed.
   template <class Describe>
   void show(std::string_view kind, Describe&& describe) const {
     Tap* const tap = listeningTap();
     if (!tap) return;
-    TapLine line = ownersLine(*tap, kind);
-    describe(line);
-    tap->write(std::move(line));
+    try {
+      TapLine line = ownersLine(*tap, kind);
+      describe(line);
+      tap->write(std::move(line));
+    } catch (const std::bad_alloc&) {
+      tap->miss();
+    }
   }
 
  private:

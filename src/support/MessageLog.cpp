@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <new>
 #include <system_error>
 
 #include "platform/FileDescriptor.h"
@@ -67,6 +68,15 @@ int writeAll(int descriptor, std::string_view text) {
   return 0;
 }
 
+template <class Write>
+void loseWithoutMemory(platform::Log& log, const Write& write) {
+  try {
+    write();
+  } catch (const std::bad_alloc&) {
+    asl_log(log, LogLevel::Critical, "No memory for a line of the tallyd log file");
+  }
+}
+
 }  // namespace
 
 bool isMessageLogFileName(std::string_view name) {
@@ -78,6 +88,14 @@ MessageLog::MessageLog(const platform::Platform& platform)
     : _platform(platform), _directory(platform.root.under(kDirectory).string()) {}
 
 void MessageLog::writeMessageLog(std::string_view message) {
+  loseWithoutMemory(_platform.log, [&] { writeLine(message); });
+}
+
+void MessageLog::writeFormatted(fmt::string_view format, fmt::format_args arguments) {
+  loseWithoutMemory(_platform.log, [&] { writeLine(fmt::vformat(format, arguments)); });
+}
+
+void MessageLog::writeLine(std::string_view message) {
   const std::lock_guard lock(_mutex);
   _platform.process.logDirectoryChecked.get([this] {
     ensureLogDirectory();

@@ -20,7 +20,8 @@ namespace tallyd {
 /// Appends time-stamped lines to the current message log file and retires the file when it is a day old.
 ///
 /// The current file's path and creation date survive restarts in the standard user defaults; when they are
-/// lost, the file is found again by its name. Every failure is logged and costs at most the one line.
+/// lost, the file is found again by its name. Every failure, also for lack of memory, is logged and costs at
+/// most the one line.
 ///
 /// Threading: any thread; calls are serialised by an internal lock, and each blocks on the disk.
 class MessageLog {
@@ -38,7 +39,7 @@ class MessageLog {
   template <class... Arguments>
   void writeMessageLog(fmt::format_string<Arguments...> format,
                        Arguments&&... arguments) requires(sizeof...(Arguments) > 0) {
-    writeMessageLog(std::string_view(fmt::format(format, std::forward<Arguments>(arguments)...)));
+    writeFormatted(format, fmt::make_format_args(arguments...));
   }
 
  private:
@@ -48,6 +49,8 @@ class MessageLog {
     std::optional<platform::Date> created;
   };
 
+  void writeFormatted(fmt::string_view format, fmt::format_args arguments);
+  void writeLine(std::string_view message);
   void ensureLogDirectory();
   CurrentFile savedFile();
   CurrentFile findExistingFile(CurrentFile file);

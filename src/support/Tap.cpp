@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <deque>
 #include <exception>
+#include <new>
 #include <utility>
 
 #include "platform/SerialQueue.h"
@@ -39,6 +40,12 @@ bool makeNonBlocking(int descriptor) {
 struct Tap::Listener {
   Listener(platform::FileDescriptor toOwn, Channel itsChannel)
       : descriptor(std::move(toOwn)), channel(itsChannel) {}
+
+  void keep(Text text) {
+    const std::size_t bytes = text->size();
+    backlog.push_back(std::move(text));
+    backlogBytes += bytes;
+  }
 
   [[nodiscard]] ssize_t send(std::string_view bytes) const {
     if (channel == Channel::Pipe) return ::write(descriptor.get(), bytes.data(), bytes.size());
@@ -95,31 +102,52 @@ void Tap::write(TapLine line) {
   for (const SharedListener& listener : _listeners) append(listener, text);
 }
 
+void Tap::miss() {
+  const std::lock_guard lock(_mutex);
+  for (const SharedListener& listener : _listeners) ++listener->missed;
+}
+
 void Tap::append(const SharedListener& listener, const Text& text) {
   if (listener->backlogBytes >= kMaximumBacklogBytes) {
     ++listener->missed;
     return;
   }
-  const Text missed = missedLine(*listener);
-  for (const Text& each : {missed, text}) {
-    if (!each) continue;
-    listener->backlog.push_back(each);
-    listener->backlogBytes += each->size();
+  try {
+    keepMissedLine(*listener);
+    listener->keep(text);
+  } catch (const std::bad_alloc&) {
+    ++listener->missed;
   }
-  if (!std::exchange(listener->isPumping, true)) pumpSoon(listener);
+  if (!listener->isPumping) startPumping(listener);
 }
 
-Tap::Text Tap::missedLine(Listener& listener) const {
-  if (listener.missed == 0) return nullptr;
-  const std::uint64_t missed = std::exchange(listener.missed, 0);
-  return std::make_shared<const std::string>(std::move(line("missed").add("count", missed)).finished());
+void Tap::keepMissedLine(Listener& listener) const {
+  if (listener.missed == 0) return;
+  listener.keep(std::make_shared<const std::string>(
+      std::move(line("missed").add("count", listener.missed)).finished()));
+  listener.missed = 0;
 }
 
-void Tap::pumpSoon(const SharedListener& listener) {
-  _queue->async([self = shared_from_this(), listener] { self->pump(listener); });
+/// Without memory for that the next line tries again. With the lock held.
+void Tap::startPumping(const SharedListener& listener) {
+  try {
+    _queue->async([self = shared_from_this(), listener] { self->pump(listener); });
+    listener->isPumping = true;
+  } catch (const std::bad_alloc&) {
+    listener->isPumping = false;
+  }
 }
 
 void Tap::pump(const SharedListener& listener) {
+  try {
+    pumpSome(listener);
+  } catch (const std::bad_alloc&) {
+    const std::lock_guard lock(_mutex);
+    listener->isPumping = false;
+  }
+}
+
+void Tap::pumpSome(const SharedListener& listener) {
   for (int i = 0; i < kWritesPerTurn; ++i) {
     const Text text = front(*listener);
     if (!text) return;
@@ -133,17 +161,13 @@ void Tap::pump(const SharedListener& listener) {
       return remove(listener);
     }
   }
-  pumpSoon(listener);
+  const std::lock_guard lock(_mutex);
+  startPumping(listener);
 }
 
 Tap::Text Tap::front(Listener& listener) {
   const std::lock_guard lock(_mutex);
-  if (listener.backlog.empty()) {
-    if (Text missed = missedLine(listener)) {
-      listener.backlogBytes += missed->size();
-      listener.backlog.push_back(std::move(missed));
-    }
-  }
+  if (listener.backlog.empty()) keepMissedLine(listener);
   listener.isPumping = !listener.isOver && !listener.backlog.empty();
   return listener.isPumping ? listener.backlog.front() : nullptr;
 }
@@ -181,7 +205,11 @@ void Tap::remove(const SharedListener& listener) {
     std::erase(_listeners, listener);
     _isListening = !_listeners.empty();
   }
-  _queue->async([listener] { listener->roomSource.reset(); });
+  try {
+    _queue->async([listener] { listener->roomSource.reset(); });
+  } catch (const std::bad_alloc&) {
+    return;  // The source, if there is one, goes with its next event.
+  }
 }
 
 }  // namespace tallyd

@@ -27,7 +27,7 @@ namespace tallyd {
 /// its line to each listener's backlog; a serial queue of the tap's own does the writing, without blocking.
 /// While 4 MiB or more wait for one listener, what comes is not kept for it but counted, and as soon as there
 /// is room it gets the line {"time": …, "kind": "missed", "count": N}. So a listener costs at most
-/// kMaximumBacklogBytes and one line.
+/// kMaximumBacklogBytes and one line. What there is no memory for is counted in the same way.
 ///
 /// A listener whose other end has gone is found out with the next line for it.
 ///
@@ -58,6 +58,8 @@ class Tap : public std::enable_shared_from_this<Tap> {
   /// A line of this kind, with the present time.
   [[nodiscard]] TapLine line(std::string_view kind) const { return {kind, _clock.now()}; }
   void write(TapLine line);
+  /// Counts a line that could not be made.
+  void miss();
 
   /// A number for what needs more than one line; never 0.
   [[nodiscard]] std::uint64_t nextNumber() { return ++_lastNumber; }
@@ -69,9 +71,10 @@ class Tap : public std::enable_shared_from_this<Tap> {
   using Text = std::shared_ptr<const std::string>;
 
   void append(const SharedListener& listener, const Text& text);
-  [[nodiscard]] Text missedLine(Listener& listener) const;
-  void pumpSoon(const SharedListener& listener);
+  void keepMissedLine(Listener& listener) const;
+  void startPumping(const SharedListener& listener);
   void pump(const SharedListener& listener);
+  void pumpSome(const SharedListener& listener);
   [[nodiscard]] Text front(Listener& listener);
   void wrote(Listener& listener, std::size_t bytes);
   void waitForRoom(const SharedListener& listener);

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <algorithm>
+#include <new>
 #include <optional>
 #include <stdexcept>
 #include <string>
@@ -67,7 +68,10 @@ class FakeServiceConnection : public platform::ServiceConnection {
   }
   void setInterruptionHandler(std::function<void()> handler) override { _interrupted = std::move(handler); }
   void setInvalidationHandler(std::function<void()> handler) override { _invalidated = std::move(handler); }
-  void resume() override { _resumed = true; }
+  void resume() override {
+    if (hasNoMemory) throw std::bad_alloc();
+    _resumed = true;
+  }
   void finish() override {
     ++finished;
     invalidate();
@@ -75,6 +79,7 @@ class FakeServiceConnection : public platform::ServiceConnection {
 
   std::optional<uid_t> peer = 0;  ///< The user who connected.
   int finished = 0;               ///< How often the service ended it.
+  bool hasNoMemory = false;       ///< It can't be resumed.
 
   [[nodiscard]] const platform::Interface* exportedInterface() const { return _interface; }
   [[nodiscard]] bool resumed() const { return _resumed; }

@@ -8,6 +8,7 @@
 #include <deque>
 #include <map>
 #include <mutex>
+#include <new>
 #include <utility>
 #include <vector>
 
@@ -63,6 +64,11 @@ class FakeQueues : public platform::Queues {
   /// Queues that somebody holds.
   [[nodiscard]] std::size_t liveQueues() const { return _state->queues; }
 
+  /// So many more pieces of work find no memory to be kept in.
+  void refuseWork(int pieces) { _state->refusals = pieces; }
+  /// Whether what is to wait finds none.
+  void refuseTimers(bool refuse) { _state->refusesTimers = refuse; }
+
   std::size_t blockingCalls = 0;
 
  private:
@@ -74,9 +80,12 @@ class FakeQueues : public platform::Queues {
     Milliseconds now{0};
     int nextID = 1;
     std::atomic<std::size_t> queues = 0;
+    std::atomic<int> refusals = 0;
+    std::atomic<bool> refusesTimers = false;
 
     void give(Work work) {
       const std::lock_guard lock(mutex);
+      if (refusals > 0 && refusals-- > 0) throw std::bad_alloc();
       ready.push_back(std::move(work));
     }
     Work take() {
@@ -87,6 +96,7 @@ class FakeQueues : public platform::Queues {
       return work;
     }
     int arm(Milliseconds delay, Work work) {
+      if (refusesTimers) throw std::bad_alloc();
       const std::lock_guard lock(mutex);
       timers.emplace(now + delay, std::pair(nextID, std::move(work)));
       return nextID++;

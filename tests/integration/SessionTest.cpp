@@ -267,6 +267,10 @@ TEST_F(SessionTest, WaitsAfterAFailedFetch) {
   EXPECT_TRUE(daemon.process().waitForLine(
       "<6>Not fetching storebag for client type 6 - must wait 900 seconds between attempts"));
   EXPECT_EQ(daemon.process().countOnce("<2>Signature is missing", 1), 1U);
+  const std::string target = storebags.http().requests().at(0).target;
+  EXPECT_EQ(daemon.process().countOnce(
+                "<4>Storebag server answers status 404 for " + storebags.http().url(target), 1),
+            1U);
   EXPECT_EQ(connection->sendMessageSync(1, 0, Dictionary{{"a", 1}}).value, std::nullopt);
   EXPECT_EQ(daemon.process().countOnce("<7>No backends available to send message", 1), 1U);
 }

@@ -1,5 +1,6 @@
 #include "platform/http/CurlHTTPClient.h"
 
+#include <new>
 #include <utility>
 
 #include "platform/http/CurlHandles.h"
@@ -23,9 +24,20 @@ class CurlHTTPClient::Implementation {
         _anchors(root.under(kAdditionalAuthorities), log),
         _environment{_share, _anchors, _limits},
         _handles(limits.maximumIdleHandles),
-        _engine(_environment, log) {}
+        _engine(_environment) {}
 
   HTTPResult sendSynchronousRequest(const HTTPRequest& request) {
+    try {
+      return perform(request);
+    } catch (const std::bad_alloc&) {
+      return outOfMemory(request);
+    }
+  }
+
+  TransferEngine& engine() { return _engine; }
+
+ private:
+  HTTPResult perform(const HTTPRequest& request) {
     CurlTransfer transfer(_handles.take(), request, CurlTransfer::ResponseBody::Keep, _environment);
     if (const auto problem = transfer.prepare()) {
       _handles.giveBack(transfer.releaseHandle());
@@ -39,9 +51,6 @@ class CurlHTTPClient::Implementation {
     return result;
   }
 
-  TransferEngine& engine() { return _engine; }
-
- private:
   Queues& _queues;
   const Limits _limits;
   TrustAnchors _anchors;

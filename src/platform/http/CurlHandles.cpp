@@ -35,6 +35,9 @@ CurlEasy CurlHandlePool::take() {
     if (!_idle.empty()) {
       CurlEasy handle = std::move(_idle.back());
       _idle.pop_back();
+      // Once more: the defaults take memory, and libcurl does not tell when it had none. Whoever lacks it now
+      // fails for itself.
+      curl_easy_reset(handle.get());
       return handle;
     }
   }

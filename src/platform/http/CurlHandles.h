@@ -54,11 +54,11 @@ class CurlShare {
 /// Threading: any thread; one handle belongs to one user at a time.
 class CurlHandlePool {
  public:
-  explicit CurlHandlePool(std::size_t maximumIdle) : _maximumIdle(maximumIdle) {}
+  explicit CurlHandlePool(std::size_t maximumIdle) : _maximumIdle(maximumIdle) { _idle.reserve(maximumIdle); }
 
   /// A handle with every option at its default; null when memory runs out.
   [[nodiscard]] CurlEasy take();
-  void giveBack(CurlEasy handle);
+  void giveBack(CurlEasy handle);  ///< Throws nothing.
 
  private:
   const std::size_t _maximumIdle;

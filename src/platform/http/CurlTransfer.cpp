@@ -21,8 +21,10 @@ using ParsedURL = std::unique_ptr<CURLU, URLDeleter>;
 /// The parsed URL, or null; a URL without a scheme is not guessed at.
 ParsedURL parseURL(const std::string& text) {
   ParsedURL url(curl_url());
-  if (url && curl_url_set(url.get(), CURLUPART_URL, text.c_str(), CURLU_NON_SUPPORT_SCHEME) != CURLUE_OK)
-    url.reset();
+  if (!url) throw std::bad_alloc();
+  const CURLUcode code = curl_url_set(url.get(), CURLUPART_URL, text.c_str(), CURLU_NON_SUPPORT_SCHEME);
+  if (code == CURLUE_OUT_OF_MEMORY) throw std::bad_alloc();
+  if (code != CURLUE_OK) url.reset();
   return url;
 }
 
@@ -89,6 +91,17 @@ HTTPResult failedRequest(const HTTPRequest& request, const std::string& reason, 
   return result;
 }
 
+HTTPResult outOfMemory(const HTTPRequest& request) noexcept {
+  constexpr const char* kReason = "out of memory";  // Short enough to lie within its string.
+  try {
+    return failedRequest(request, kReason);
+  } catch (const std::bad_alloc&) {
+    HTTPResult result;
+    result.error = kReason;
+    return result;
+  }
+}
+
 /// Sets options and remembers the first that was refused.
 class CurlTransfer::Options {
  public:
@@ -113,7 +126,7 @@ CurlTransfer::CurlTransfer(CurlEasy handle, HTTPRequest request, ResponseBody re
       _environment(environment) {}
 
 std::optional<std::string> CurlTransfer::prepare() {
-  if (!_handle) return "out of memory";
+  if (!_handle) throw std::bad_alloc();
   if (!parseURL(_request.url)) return "bad URL";
   if (!isToken(_request.method)) return "bad method";
   if (_request.method == "GET" && !_request.body.empty()) return "a GET request can't carry a body";
@@ -127,6 +140,7 @@ std::optional<std::string> CurlTransfer::prepare() {
   setConnection(options);
   setTimes(options);
   setCallbacks(options);
+  if (options.code() == CURLE_OUT_OF_MEMORY) throw std::bad_alloc();
   if (options.code() != CURLE_OK) return curl_easy_strerror(options.code());
   return std::nullopt;
 }
@@ -193,6 +207,9 @@ void CurlTransfer::setConnection(Options& options) {
   // connection.
   options.set(CURLOPT_CAINFO, static_cast<char*>(nullptr));
   options.set(CURLOPT_CAPATH, static_cast<char*>(nullptr));
+  // The defaults; but a handle may have found no memory for its own.
+  options.set(CURLOPT_SSL_VERIFYPEER, 1L);
+  options.set(CURLOPT_SSL_VERIFYHOST, 2L);
   options.set(CURLOPT_SSL_CTX_FUNCTION, &CurlTransfer::onTLSContext);
   options.set(CURLOPT_SSL_CTX_DATA, &_environment.anchors);
 }
@@ -246,6 +263,7 @@ HTTPResult CurlTransfer::failure(CURLcode code) const {
         _request, fmt::format("response of more than {} bytes", _environment.limits.maximumResponseBytes),
         HTTPFailure::Permanent);
   }
+  if (_outOfMemory) return outOfMemory(_request);
   return failedRequest(_request,
                        _error.front() != '\0' ? std::string(_error.data()) : curl_easy_strerror(code),
                        isPermanent(code) ? HTTPFailure::Permanent : HTTPFailure::Transfer);
@@ -277,6 +295,7 @@ std::size_t CurlTransfer::onBody(char* bytes, std::size_t size, std::size_t coun
   try {
     return transfer.received(bytes, size * count, transfer._responseBody) ? size * count : 0;
   } catch (const std::bad_alloc&) {
+    transfer._outOfMemory = true;
     return 0;  // Ends the transfer; an exception may not pass through libcurl.
   }
 }
@@ -292,8 +311,12 @@ int CurlTransfer::onStart(void* self, char*, char*, int, int) {
 }
 
 CURLcode CurlTransfer::onTLSContext(CURL*, void* context, void* anchors) {
-  const bool applied = static_cast<TrustAnchors*>(anchors)->applyTo(static_cast<ssl_ctx_st*>(context));
-  return applied ? CURLE_OK : CURLE_OUT_OF_MEMORY;
+  try {
+    const bool applied = static_cast<TrustAnchors*>(anchors)->applyTo(static_cast<ssl_ctx_st*>(context));
+    return applied ? CURLE_OK : CURLE_OUT_OF_MEMORY;
+  } catch (const std::bad_alloc&) {
+    return CURLE_OUT_OF_MEMORY;
+  }
 }
 
 }  // namespace tallyd::platform

@@ -28,6 +28,10 @@ struct CurlEnvironment {
 [[nodiscard]] HTTPResult failedRequest(const HTTPRequest& request, const std::string& reason,
                                        HTTPFailure kind = HTTPFailure::Transfer);
 
+/// The error of a request for which memory ran out; of the next attempt nothing is known. Takes no memory
+/// where there is none, and then lacks the URL.
+[[nodiscard]] HTTPResult outOfMemory(const HTTPRequest& request) noexcept;
+
 /// Sets a handle up for a request, receives the response, and says what became of it.
 ///
 /// Life cycle: prepare(), then the handle is run by curl_easy_perform or a multi handle, once more when
@@ -44,7 +48,7 @@ class CurlTransfer {
   CurlTransfer(const CurlTransfer&) = delete;
   CurlTransfer& operator=(const CurlTransfer&) = delete;
 
-  /// Sets every option; what is wrong with the request, or nothing.
+  /// Sets every option; what is wrong with the request, or nothing. Throws std::bad_alloc.
   [[nodiscard]] std::optional<std::string> prepare();
 
   [[nodiscard]] CURL* handle() const { return _handle.get(); }
@@ -86,6 +90,7 @@ class CurlTransfer {
   std::string _body;
   std::size_t _receivedBytes = 0;
   bool _tooLarge = false;
+  bool _outOfMemory = false;
   bool _started = false;
   bool _secondAttempt = false;
 };

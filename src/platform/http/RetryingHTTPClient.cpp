@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include <mutex>
+#include <new>
 #include <unordered_set>
 #include <utility>
 
@@ -45,18 +46,15 @@ class RetryingHTTPClient::Posts : public std::enable_shared_from_this<Posts> {
     const auto post = std::make_shared<Post>(
         Post{std::move(request), std::move(queue), std::move(completion), heldBytes, _now(), {}});
     const std::lock_guard lock(_mutex);
-    if (heldBytes > _limits.maximumPendingBytes - _heldBytes) return refuse(*post);
-    _heldBytes += heldBytes;
+    if (heldBytes > _limits.maximumPendingBytes - _heldBytes) return refuse(post);
     attempt(post);
+    _heldBytes += heldBytes;  // Now that it is taken. Its completion waits for the lock.
   }
 
   void close() {
     const std::lock_guard lock(_mutex);
     _isClosed = true;
-    for (const auto& post : std::exchange(_waiting, {})) {
-      _heldBytes -= post->heldBytes;
-      tell(*post, std::move(post->lastResult));
-    }
+    std::erase_if(_waiting, [](const SharedPost& post) { return tellLastResult(post); });
   }
 
  private:
@@ -71,15 +69,26 @@ class RetryingHTTPClient::Posts : public std::enable_shared_from_this<Posts> {
   };
   using SharedPost = std::shared_ptr<Post>;
 
-  static void tell(const Post& post, HTTPResult result) {
-    post.queue->async([completion = post.completion, result = std::move(result)] { completion(result); });
+  static void tell(const SharedPost& post) {
+    post->queue->async([post] { post->completion(post->lastResult); });
   }
 
-  void refuse(const Post& post) const {
-    tell(post, failedRequest(post.request,
-                             fmt::format("too many unfinished requests, which may hold {} bytes",
-                                         _limits.maximumPendingBytes),
-                             HTTPFailure::TooMuchWaits));
+  /// False when there is no memory for that: it is told when its wait is over.
+  static bool tellLastResult(const SharedPost& post) {
+    try {
+      tell(post);
+      return true;
+    } catch (const std::bad_alloc&) {
+      return false;
+    }
+  }
+
+  void refuse(const SharedPost& post) const {
+    post->lastResult = failedRequest(
+        post->request,
+        fmt::format("too many unfinished requests, which may hold {} bytes", _limits.maximumPendingBytes),
+        HTTPFailure::TooMuchWaits);
+    tell(post);
   }
 
   /// Under the lock: the client is not used any more once this is closed.
@@ -90,12 +99,24 @@ class RetryingHTTPClient::Posts : public std::enable_shared_from_this<Posts> {
   }
 
   void attempted(const SharedPost& post, const HTTPResult& result) {
-    if (waitForAnotherAttempt(post, result)) return;
+    if (!waitsForAnotherAttempt(post, result)) complete(*post, result);
+  }
+
+  void complete(const Post& post, const HTTPResult& result) {
     {
       const std::lock_guard lock(_mutex);
-      _heldBytes -= post->heldBytes;
+      _heldBytes -= post.heldBytes;
     }
-    post->completion(result);
+    post.completion(result);
+  }
+
+  /// Without the memory for another attempt there is none.
+  bool waitsForAnotherAttempt(const SharedPost& post, const HTTPResult& result) {
+    try {
+      return waitForAnotherAttempt(post, result);
+    } catch (const std::bad_alloc&) {
+      return false;
+    }
   }
 
   bool waitForAnotherAttempt(const SharedPost& post, const HTTPResult& result) {
@@ -104,9 +125,10 @@ class RetryingHTTPClient::Posts : public std::enable_shared_from_this<Posts> {
         post->retries, std::chrono::ceil<std::chrono::milliseconds>(_now() - post->begun), _clock.now()};
     const auto wait = decideRetry(result, failed, uniformDraw(_randomness), _limits);
     if (!wait) return false;
+    const std::string reason = reasonOf(post->request, result);
     if (!hold(post, result, *wait)) return false;
     asl_log(_log, LogLevel::Info, "Post failed, attempt {} of {} follows in {} ms: {}", post->retries + 1,
-            _limits.attempts + 1, wait->count(), reasonOf(post->request, result));
+            _limits.attempts + 1, wait->count(), reason);
     return true;
   }
 
@@ -114,16 +136,34 @@ class RetryingHTTPClient::Posts : public std::enable_shared_from_this<Posts> {
   bool hold(const SharedPost& post, const HTTPResult& result, std::chrono::milliseconds wait) {
     const std::lock_guard lock(_mutex);
     if (_isClosed) return false;
-    ++post->retries;
     post->lastResult = result;
-    _waiting.insert(post);
-    post->queue->asyncAfter(wait, [self = shared_from_this(), post] { self->waited(post); });
+    const auto waiting = _waiting.insert(post).first;
+    try {
+      post->queue->asyncAfter(wait, [self = shared_from_this(), post] { self->waited(post); });
+    } catch (const std::bad_alloc&) {
+      _waiting.erase(waiting);
+      throw;
+    }
+    ++post->retries;
     return true;
   }
 
   void waited(const SharedPost& post) {
+    if (!attemptAgain(post)) complete(*post, post->lastResult);
+  }
+
+  /// False when there can't be another attempt, and the post's last result says why it has failed.
+  bool attemptAgain(const SharedPost& post) {
     const std::lock_guard lock(_mutex);
-    if (_waiting.erase(post) > 0) attempt(post);
+    if (_waiting.erase(post) == 0) return true;  // It has been told already.
+    if (_isClosed) return false;
+    try {
+      attempt(post);
+      return true;
+    } catch (const std::bad_alloc&) {
+      post->lastResult = outOfMemory(post->request);
+      return false;
+    }
   }
 
   HTTPClient& _client;

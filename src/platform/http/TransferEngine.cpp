@@ -3,8 +3,8 @@
 #include <fmt/format.h>
 
 #include <algorithm>
-#include <exception>
-#include <iterator>
+#include <new>
+#include <system_error>
 #include <utility>
 
 #include "platform/http/RequestBytes.h"
@@ -17,28 +17,26 @@ using std::chrono::steady_clock;
 
 /// How often waiting requests are looked over for those that have waited too long.
 constexpr std::chrono::milliseconds kExpiryPeriod{1000};
+/// How often the queues are offered the completions for which they had no memory.
+constexpr int kTellAgainMs = 100;
 /// With nothing to do the thread only waits to be woken; the figure bounds nothing.
 constexpr int kIdlePollMs = 3'600'000;
 
 }  // namespace
 
-TransferEngine::Inbox::Answer TransferEngine::Inbox::add(WaitingRequest& request) {
+TransferEngine::Inbox::Answer TransferEngine::Inbox::add(Jobs& job) {
   const std::lock_guard lock(_mutex);
   if (_closed) return Answer::Closed;
-  if (request.client.heldBytes > _maximumBytes - _heldBytes) return Answer::Full;
-  const std::size_t heldBytes = request.client.heldBytes;
-  _requests.push_back(std::move(request));
+  const std::size_t heldBytes = job.front().heldBytes;
+  if (heldBytes > _maximumBytes - _heldBytes) return Answer::Full;
+  _jobs.splice(_jobs.end(), job);
   _heldBytes += heldBytes;
-  return _requests.size() == 1 ? Answer::TakenAsFirst : Answer::Taken;
+  return _jobs.size() == 1 ? Answer::TakenAsFirst : Answer::Taken;
 }
 
-void TransferEngine::Inbox::takeAll(std::deque<WaitingRequest>& waiting) {
-  std::vector<WaitingRequest> requests;
-  {
-    const std::lock_guard lock(_mutex);
-    requests.swap(_requests);
-  }
-  std::move(requests.begin(), requests.end(), std::back_inserter(waiting));
+void TransferEngine::Inbox::takeAll(Jobs& waiting) {
+  const std::lock_guard lock(_mutex);
+  waiting.splice(waiting.end(), _jobs);
 }
 
 void TransferEngine::Inbox::release(std::size_t bytes) {
@@ -56,9 +54,8 @@ bool TransferEngine::Inbox::isClosed() const {
   return _closed;
 }
 
-TransferEngine::TransferEngine(const CurlEnvironment& environment, Log& log)
+TransferEngine::TransferEngine(const CurlEnvironment& environment)
     : _environment(environment),
-      _log(log),
       _inbox(environment.limits.maximumPendingBytes),
       _multi(curl_multi_init()),
       _pool(environment.limits.maximumIdleHandles) {
@@ -79,81 +76,92 @@ void TransferEngine::submit(HTTPRequest request, std::shared_ptr<SerialQueue> qu
                             HTTPClient::Completion completion) {
   const auto patience = request.timeout.count() > 0 ? request.timeout : _environment.limits.stallTime;
   const std::size_t heldBytes = heldBytesOf(request);
-  WaitingRequest waiting{
-      std::move(request),
-      {std::move(queue), std::move(completion), heldBytes, steady_clock::now() + patience}};
-  const Inbox::Answer answer = _inbox.add(waiting);
-  if (answer == Inbox::Answer::Taken) return;  // Whoever brought the first has woken the thread.
-  if (answer == Inbox::Answer::TakenAsFirst) {
-    std::call_once(_threadStarted, [this] { startThread(); });
-    curl_multi_wakeup(_multi.get());
-    return;
+  Jobs job;
+  job.push_back({std::move(request), std::move(queue),
+                 std::make_shared<Outcome>(Outcome{std::move(completion), {}}), heldBytes,
+                 steady_clock::now() + patience});
+  if (!hasThread()) return refuse(job.front(), "no thread for HTTP transfers", HTTPFailure::Transfer);
+  switch (_inbox.add(job)) {
+    case Inbox::Answer::TakenAsFirst:
+      curl_multi_wakeup(_multi.get());
+      return;
+    case Inbox::Answer::Taken:
+      return;  // Whoever brought the first has woken the thread.
+    case Inbox::Answer::Full:
+      return refuse(job.front(),
+                    fmt::format("too many unfinished requests, which may hold {} bytes",
+                                _environment.limits.maximumPendingBytes),
+                    HTTPFailure::TooMuchWaits);
+    case Inbox::Answer::Closed:
+      return refuse(job.front(), "HTTP transfers have ended", HTTPFailure::Transfer);
   }
-  const std::string reason = answer == Inbox::Answer::Closed
-                                 ? "HTTP transfers have ended"
-                                 : fmt::format("too many unfinished requests, which may hold {} bytes",
-                                               _environment.limits.maximumPendingBytes);
-  HTTPResult result = failedRequest(waiting.request, reason);
-  if (answer == Inbox::Answer::Full) result.failure = HTTPFailure::TooMuchWaits;
-  waiting.client.heldBytes = 0;
-  tell(std::move(waiting.client), std::move(result));
 }
 
-void TransferEngine::startThread() {
-  _thread = std::thread([this] { threadMain(); });
-}
-
-void TransferEngine::threadMain() noexcept {
-  std::string reason = "the HTTP client is going away";
+/// A thread that can't be had is tried for again with the next request.
+bool TransferEngine::hasThread() {
+  const std::lock_guard lock(_threadMutex);
+  if (_thread.joinable()) return true;
   try {
-    run();
-  } catch (const std::exception& exception) {
-    reason = exception.what();
-    asl_log(_log, LogLevel::Critical, "HTTP transfers end: {}", reason);
+    _thread = std::thread([this] { run(); });
+    return true;
+  } catch (const std::system_error&) {
+    return false;
   }
-  _inbox.close();
-  failUnfinished(reason);
 }
 
-void TransferEngine::run() {
+void TransferEngine::refuse(Job& job, const std::string& reason, HTTPFailure kind) {
+  job.outcome->result = failedRequest(job.request, reason, kind);
+  tell(job);
+}
+
+/// Nothing but a request's own handling takes memory here.
+void TransferEngine::run() noexcept {
   while (!_inbox.isClosed()) {
     startWaiting();
     int running = 0;
     curl_multi_perform(_multi.get(), &running);
     finishDone();
     expireLate();
+    tellSettled();
     curl_multi_poll(_multi.get(), nullptr, 0, pollTimeoutMs(), nullptr);
   }
+  failUnfinished();
 }
 
 int TransferEngine::pollTimeoutMs() const {
   const bool canStart = !_waiting.empty() && _active.size() < _environment.limits.maximumActiveTransfers;
   if (canStart) return 0;
+  if (!_settled.empty()) return kTellAgainMs;
   return _active.empty() ? kIdlePollMs : static_cast<int>(kExpiryPeriod.count());
 }
 
 void TransferEngine::startWaiting() {
   _inbox.takeAll(_waiting);
-  while (!_waiting.empty() && _active.size() < _environment.limits.maximumActiveTransfers) {
-    WaitingRequest next = std::move(_waiting.front());
-    _waiting.pop_front();
-    start(std::move(next));
-  }
+  while (!_waiting.empty() && _active.size() < _environment.limits.maximumActiveTransfers)
+    start(_waiting.begin());
 }
 
-void TransferEngine::start(WaitingRequest request) {
-  auto transfer = std::make_unique<CurlTransfer>(_pool.take(), std::move(request.request),
-                                                 CurlTransfer::ResponseBody::Drop, _environment);
-  CURL* const handle = transfer->handle();
-  std::optional<std::string> problem = transfer->prepare();
-  if (!problem && curl_multi_add_handle(_multi.get(), handle) != CURLM_OK) problem = "out of memory";
-  if (problem) {
-    HTTPResult result = failedRequest(transfer->request(), *problem, HTTPFailure::Permanent);
-    _pool.giveBack(transfer->releaseHandle());
-    tell(std::move(request.client), std::move(result));
-    return;
+void TransferEngine::start(Jobs::iterator job) {
+  std::optional<std::string> problem;
+  try {
+    problem = prepare(*job);
+  } catch (const std::bad_alloc&) {
+    return settle(_waiting, job, &outOfMemory);
   }
-  _active.emplace(handle, ActiveTransfer{std::move(transfer), std::move(request.client)});
+  if (problem) {
+    return settle(_waiting, job, [&problem](const HTTPRequest& request) {
+      return failedRequest(request, *problem, HTTPFailure::Permanent);
+    });
+  }
+  _active.splice(_active.end(), _waiting, job);
+}
+
+std::optional<std::string> TransferEngine::prepare(Job& job) {
+  job.transfer = std::make_unique<CurlTransfer>(_pool.take(), std::move(job.request),
+                                                CurlTransfer::ResponseBody::Drop, _environment);
+  if (auto problem = job.transfer->prepare()) return problem;
+  if (curl_multi_add_handle(_multi.get(), job.transfer->handle()) != CURLM_OK) throw std::bad_alloc();
+  return std::nullopt;
 }
 
 void TransferEngine::finishDone() {
@@ -161,13 +169,17 @@ void TransferEngine::finishDone() {
   while (const CURLMsg* message = curl_multi_info_read(_multi.get(), &left)) {
     if (message->msg != CURLMSG_DONE) continue;
     const CURLcode code = message->data.result;
-    if (sendAgain(message->easy_handle, code)) continue;
-    finish(message->easy_handle, [code](CurlTransfer& transfer) { return transfer.result(code); });
+    CURL* const handle = message->easy_handle;
+    const auto job = std::find_if(_active.begin(), _active.end(),
+                                  [handle](const Job& each) { return each.transfer->handle() == handle; });
+    CurlTransfer& transfer = *job->transfer;
+    if (sendAgain(handle, code, transfer)) continue;
+    settle(_active, job, [&transfer, code](const HTTPRequest&) { return transfer.result(code); });
   }
 }
 
-bool TransferEngine::sendAgain(CURL* handle, CURLcode code) {
-  if (!_active.at(handle).transfer->prepareSecondAttempt(code)) return false;
+bool TransferEngine::sendAgain(CURL* handle, CURLcode code, CurlTransfer& transfer) {
+  if (!transfer.prepareSecondAttempt(code)) return false;
   curl_multi_remove_handle(_multi.get(), handle);
   return curl_multi_add_handle(_multi.get(), handle) == CURLM_OK;
 }
@@ -177,54 +189,69 @@ void TransferEngine::expireLate() {
   const Moment now = steady_clock::now();
   if (now < _nextExpiry) return;
   _nextExpiry = now + kExpiryPeriod;
-  constexpr const char* kReason = "no connection became free in time";
-
-  std::vector<CURL*> late;
-  for (const auto& [handle, active] : _active) {
-    if (!active.transfer->hasStarted() && active.client.startBy + kExpiryPeriod < now) late.push_back(handle);
-  }
-  for (CURL* handle : late) {
-    finish(handle, [](CurlTransfer& transfer) { return failedRequest(transfer.request(), kReason); });
-  }
-  std::deque<WaitingRequest> stillWaiting;
-  for (WaitingRequest& waiting : _waiting) {
-    if (waiting.client.startBy < now) {
-      tell(std::move(waiting.client), failedRequest(waiting.request, kReason));
-    } else {
-      stillWaiting.push_back(std::move(waiting));
-    }
-  }
-  _waiting.swap(stillWaiting);
+  settleLate(_active, [now](const Job& job) {
+    return !job.transfer->hasStarted() && job.startBy + kExpiryPeriod < now;
+  });
+  settleLate(_waiting, [now](const Job& job) { return job.startBy < now; });
 }
 
-void TransferEngine::finish(CURL* handle, const std::function<HTTPResult(CurlTransfer&)>& result) {
-  const auto found = _active.find(handle);
-  ActiveTransfer active = std::move(found->second);
-  _active.erase(found);
-  HTTPResult outcome = result(*active.transfer);
-  curl_multi_remove_handle(_multi.get(), handle);
-  _pool.giveBack(active.transfer->releaseHandle());
-  active.transfer.reset();
-  tell(std::move(active.client), std::move(outcome));
+template <class IsLate>
+void TransferEngine::settleLate(Jobs& jobs, const IsLate& isLate) {
+  for (auto next = jobs.begin(); next != jobs.end();) {
+    const auto job = next++;
+    if (!isLate(*job)) continue;
+    settle(jobs, job, [](const HTTPRequest& request) {
+      return failedRequest(request, "no connection became free in time");
+    });
+  }
 }
 
-void TransferEngine::failUnfinished(const std::string& reason) {
+template <class MakeResult>
+void TransferEngine::settle(Jobs& from, Jobs::iterator job, const MakeResult& makeResult) {
+  const HTTPRequest& request = job->transfer ? job->transfer->request() : job->request;
+  HTTPResult& result = job->outcome->result;
+  try {
+    result = makeResult(request);
+  } catch (const std::bad_alloc&) {
+    result = outOfMemory(request);
+  }
+  if (job->transfer) {
+    curl_multi_remove_handle(_multi.get(), job->transfer->handle());
+    _pool.giveBack(job->transfer->releaseHandle());
+    job->transfer.reset();
+  }
+  job->request = {};
+  _inbox.release(job->heldBytes);
+  _settled.splice(_settled.end(), from, job);
+}
+
+void TransferEngine::failUnfinished() {
+  const auto goingAway = [](const HTTPRequest& request) {
+    return failedRequest(request, "the HTTP client is going away");
+  };
   _inbox.takeAll(_waiting);
-  while (!_active.empty()) {
-    finish(_active.begin()->first,
-           [&reason](CurlTransfer& transfer) { return failedRequest(transfer.request(), reason); });
+  for (Jobs* jobs : {&_active, &_waiting}) {
+    while (!jobs->empty()) settle(*jobs, jobs->begin(), goingAway);
   }
-  for (WaitingRequest& waiting : _waiting) {
-    tell(std::move(waiting.client), failedRequest(waiting.request, reason));
-  }
-  _waiting.clear();
+  for (tellSettled(); !_settled.empty(); tellSettled())
+    curl_multi_poll(_multi.get(), nullptr, 0, kTellAgainMs, nullptr);
 }
 
-void TransferEngine::tell(Client client, HTTPResult result) {
-  _inbox.release(client.heldBytes);
-  SerialQueue& queue = *client.queue;
-  queue.async(
-      [completion = std::move(client.completion), result = std::move(result)] { completion(result); });
+/// In order. The first for which its queue has no memory stays, and what is behind it.
+void TransferEngine::tellSettled() {
+  try {
+    for (; !_settled.empty(); _settled.pop_front()) tell(_settled.front());
+  } catch (const std::bad_alloc&) {
+    return;
+  }
+}
+
+void TransferEngine::tell(const Job& job) {
+  job.queue->async([outcome = job.outcome] {
+    // What the completion holds goes here, and not wherever the last one lets go of the outcome.
+    const auto completion = std::exchange(outcome->completion, nullptr);
+    completion(outcome->result);
+  });
 }
 
 }  // namespace tallyd::platform

@@ -2,15 +2,14 @@
 #pragma once
 
 #include <chrono>
-#include <deque>
+#include <list>
 #include <memory>
 #include <mutex>
+#include <optional>
+#include <string>
 #include <thread>
-#include <unordered_map>
-#include <vector>
 
 #include "platform/HTTPClient.h"
-#include "platform/Log.h"
 #include "platform/http/CurlHandles.h"
 #include "platform/http/CurlTransfer.h"
 
@@ -22,35 +21,40 @@ namespace tallyd::platform {
 /// wait in order of arrival; what all of them hold together is bounded too. Destroying the engine fails what
 /// is unfinished and waits for the thread.
 ///
+/// Memory that runs out fails the request that needed it, and no other. What it takes to keep a request and
+/// to tell its end is there before it is taken; only the queue's record of the completion is not, and is
+/// asked for until it can be had.
+///
 /// Threading: any thread may submit.
 class TransferEngine {
  public:
-  /// Borrows both.
-  TransferEngine(const CurlEnvironment& environment, Log& log);
+  /// Borrows the environment.
+  explicit TransferEngine(const CurlEnvironment& environment);
   ~TransferEngine();
   TransferEngine(const TransferEngine&) = delete;
   TransferEngine& operator=(const TransferEngine&) = delete;
 
+  /// Throws std::bad_alloc when it can't even be taken; its completion is not called then.
   void submit(HTTPRequest request, std::shared_ptr<SerialQueue> queue, HTTPClient::Completion completion);
 
  private:
   using Moment = std::chrono::steady_clock::time_point;
 
-  /// Who is to be told about a request, and how much it holds.
-  struct Client {
-    std::shared_ptr<SerialQueue> queue;
+  /// What a completion is called with, and when.
+  struct Outcome {
     HTTPClient::Completion completion;
+    HTTPResult result;
+  };
+  /// One request, from its arrival until its completion is on its queue.
+  struct Job {
+    HTTPRequest request;  ///< Until there is a transfer, which has it then.
+    std::shared_ptr<SerialQueue> queue;
+    std::shared_ptr<Outcome> outcome;
     std::size_t heldBytes;
     Moment startBy;  ///< When it must have found a connection.
+    std::unique_ptr<CurlTransfer> transfer{};
   };
-  struct WaitingRequest {
-    HTTPRequest request;
-    Client client;
-  };
-  struct ActiveTransfer {
-    std::unique_ptr<CurlTransfer> transfer;
-    Client client;
-  };
+  using Jobs = std::list<Job>;  ///< From one to another they move without memory.
 
   /// What submitters and the thread share.
   class Inbox {
@@ -58,8 +62,8 @@ class TransferEngine {
     enum class Answer { TakenAsFirst, Taken, Full, Closed };
     explicit Inbox(std::size_t maximumBytes) : _maximumBytes(maximumBytes) {}
 
-    [[nodiscard]] Answer add(WaitingRequest& request);  ///< Moves from `request` when it is taken.
-    void takeAll(std::deque<WaitingRequest>& waiting);
+    [[nodiscard]] Answer add(Jobs& job);  ///< Moves the one job out when it is taken.
+    void takeAll(Jobs& waiting);
     void release(std::size_t bytes);
     void close();
     [[nodiscard]] bool isClosed() const;
@@ -67,36 +71,41 @@ class TransferEngine {
    private:
     const std::size_t _maximumBytes;
     mutable std::mutex _mutex;
-    std::vector<WaitingRequest> _requests;
+    Jobs _jobs;
     std::size_t _heldBytes = 0;
     bool _closed = false;
   };
 
-  void startThread();
-  void threadMain() noexcept;
-  void run();
+  [[nodiscard]] bool hasThread();
+  static void refuse(Job& job, const std::string& reason, HTTPFailure kind);
+  void run() noexcept;
   void startWaiting();
-  void start(WaitingRequest request);
+  void start(Jobs::iterator job);
+  [[nodiscard]] std::optional<std::string> prepare(Job& job);
   void finishDone();
-  [[nodiscard]] bool sendAgain(CURL* handle, CURLcode code);
+  [[nodiscard]] bool sendAgain(CURL* handle, CURLcode code, CurlTransfer& transfer);
   void expireLate();
-  void finish(CURL* handle, const std::function<HTTPResult(CurlTransfer&)>& result);
-  void failUnfinished(const std::string& reason);
-  void tell(Client client, HTTPResult result);
+  template <class IsLate>
+  void settleLate(Jobs& jobs, const IsLate& isLate);
+  template <class MakeResult>
+  void settle(Jobs& from, Jobs::iterator job, const MakeResult& makeResult);
+  void failUnfinished();
+  void tellSettled();
+  static void tell(const Job& job);
   [[nodiscard]] int pollTimeoutMs() const;
 
   const CurlEnvironment& _environment;
-  Log& _log;
   Inbox _inbox;
   CurlMulti _multi;
-  std::once_flag _threadStarted;
 
   // Only the thread touches these.
   CurlHandlePool _pool;
-  std::deque<WaitingRequest> _waiting;
-  std::unordered_map<CURL*, ActiveTransfer> _active;
+  Jobs _waiting;
+  Jobs _active;
+  Jobs _settled;  ///< Have their results; their completions are still to be told.
   Moment _nextExpiry{};
 
+  std::mutex _threadMutex;
   std::thread _thread;
 };
 

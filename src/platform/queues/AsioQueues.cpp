@@ -12,8 +12,10 @@
 namespace tallyd::platform {
 
 struct AsioQueues::Parts {
-  explicit Parts(std::size_t threads)
-      : idle(asio::make_work_guard(*loop.context)), pool(*loop.context, std::max<std::size_t>(threads, 1)) {}
+  Parts(std::size_t threads, Log* log)
+      : loop(log),
+        idle(asio::make_work_guard(*loop.context)),
+        pool(*loop.context, std::max<std::size_t>(threads, 1)) {}
 
   EventLoop loop;
   asio::executor_work_guard<asio::io_context::executor_type>
@@ -43,7 +45,7 @@ std::size_t AsioQueues::defaultThreadCount() {
   return std::max<std::size_t>(std::thread::hardware_concurrency(), 2);
 }
 
-AsioQueues::AsioQueues(std::size_t threads) : _parts(std::make_unique<Parts>(threads)) {}
+AsioQueues::AsioQueues(std::size_t threads, Log* log) : _parts(std::make_unique<Parts>(threads, log)) {}
 
 AsioQueues::~AsioQueues() = default;
 

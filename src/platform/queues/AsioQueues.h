@@ -9,10 +9,16 @@
 
 namespace tallyd::platform {
 
+class Log;
+
 /// Serial queues that share a pool of threads; a queue costs memory only.
 ///
 /// The threads start with the first queue, so that a process can confine itself before. While a thread of the
 /// pool waits in a blockingCall() another one takes its place.
+///
+/// An exception that leaves a piece of work ends the process; with a log, it costs that piece and a critical
+/// line, and everything else goes on. Memory for the loop's own records of events, of some hundred bytes,
+/// must be there: without it an event would never be heard of, and the process ends, after a critical line.
 ///
 /// Life cycle: the destructor stops and joins the threads and drops the work that has not started. The queues
 /// and sources made here must be gone by then, but for those that only queued work and handlers hold.
@@ -20,7 +26,8 @@ class AsioQueues final : public Queues {
  public:
   static std::size_t defaultThreadCount();  ///< One for each core, but at least two.
 
-  explicit AsioQueues(std::size_t threads = defaultThreadCount());
+  /// Borrows the log, if there is one.
+  explicit AsioQueues(std::size_t threads = defaultThreadCount(), Log* log = nullptr);
   ~AsioQueues() override;
   AsioQueues(const AsioQueues&) = delete;
   AsioQueues& operator=(const AsioQueues&) = delete;

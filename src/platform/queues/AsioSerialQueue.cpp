@@ -5,11 +5,16 @@
 #include <asio/post.hpp>
 #include <asio/steady_timer.hpp>
 #include <asio/strand.hpp>
+#include <cstdlib>
+#include <exception>
 #include <utility>
+
+#include "platform/Fatal.h"
+#include "platform/Log.h"
 
 namespace tallyd::platform {
 
-EventLoop::EventLoop() : context(std::make_unique<asio::io_context>()) {}
+EventLoop::EventLoop(Log* toBorrow) : log(toBorrow), context(std::make_unique<asio::io_context>()) {}
 
 EventLoop::~EventLoop() {
   stopping = true;
@@ -36,13 +41,14 @@ AsioSerialQueue::~AsioSerialQueue() = default;
 
 void AsioSerialQueue::async(Work work) {
   if (_loop.stopping) return;
-  // An exception that leaves a piece of work is a bug and ends the process.
-  asio::post(_strand->strand, [self = shared_from_this(), work = std::move(work)]() noexcept { work(); });
+  asio::post(_strand->strand,
+             [self = shared_from_this(), work = std::move(work)]() noexcept { self->run(work); });
 }
 
 void AsioSerialQueue::dispatch(Work work) {
   if (_loop.stopping) return;
-  asio::dispatch(_strand->strand, [self = shared_from_this(), work = std::move(work)]() noexcept { work(); });
+  asio::dispatch(_strand->strand,
+                 [self = shared_from_this(), work = std::move(work)]() noexcept { self->run(work); });
 }
 
 void AsioSerialQueue::asyncAfter(std::chrono::milliseconds delay, Work work) {
@@ -51,8 +57,25 @@ void AsioSerialQueue::asyncAfter(std::chrono::milliseconds delay, Work work) {
   auto& waiting = *timer;
   waiting.async_wait([self = shared_from_this(), timer = std::move(timer),
                       work = std::move(work)](const asio::error_code& error) mutable noexcept {
-    if (!error) self->dispatch(std::move(work));
+    if (!error) self->mustHaveMemory([&] { self->dispatch(std::move(work)); });
   });
+}
+
+void AsioSerialQueue::run(const Work& work) const noexcept {
+  if (!_loop.log) return work();
+  try {
+    work();
+  } catch (const std::exception& exception) {
+    asl_log(*_loop.log, LogLevel::Critical, "Gave up work on queue {}: {}", _label, exception.what());
+  } catch (...) {
+    asl_log(*_loop.log, LogLevel::Critical, "Gave up work on queue {}", _label);
+  }
+}
+
+void AsioSerialQueue::endWithoutMemory() const noexcept {
+  if (_loop.log)
+    fatalFailure(*_loop.log, FatalFailures::EndProcess, "No memory for the events of queue {}", _label);
+  std::abort();
 }
 
 std::unique_ptr<Source> AsioSerialQueue::makeTimer(std::chrono::milliseconds first,

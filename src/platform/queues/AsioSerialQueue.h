@@ -4,6 +4,7 @@
 #include <atomic>
 #include <memory>
 #include <mutex>
+#include <new>
 #include <string>
 #include <unordered_set>
 
@@ -12,10 +13,12 @@
 
 namespace tallyd::platform {
 
+class Log;
 class SourceState;
 
 /// What the queues of one pool share.
 struct EventLoop {
+  Log* const log;  ///< Where work that throws is told of; may be null.
   std::unique_ptr<asio::io_context> context;
   DescriptorTable descriptors;
   std::atomic<bool> stopping{false};  ///< Nothing is taken any more; what is queued is being dropped.
@@ -25,7 +28,7 @@ struct EventLoop {
   std::mutex sourcesMutex;
   std::unordered_set<std::shared_ptr<SourceState>> sources;
 
-  EventLoop();
+  explicit EventLoop(Log* toBorrow);
   ~EventLoop();  ///< After the threads have been joined.
   EventLoop(const EventLoop&) = delete;
   EventLoop& operator=(const EventLoop&) = delete;
@@ -51,10 +54,23 @@ class AsioSerialQueue final : public SerialQueue, public std::enable_shared_from
 
   /// As async(), but at once when the queue is idle and this is a thread of the pool.
   void dispatch(Work work);
+  /// Runs a piece of work, which may throw if there is a log to tell of it.
+  void run(const Work& work) const noexcept;
+  /// Takes a step without which nobody would hear of an event any more: no memory for it ends the process.
+  template <class Step>
+  void mustHaveMemory(const Step& step) const noexcept {
+    try {
+      step();
+    } catch (const std::bad_alloc&) {
+      endWithoutMemory();
+    }
+  }
   [[nodiscard]] EventLoop& loop() const { return _loop; }
 
  private:
   struct Strand;
+
+  [[noreturn]] void endWithoutMemory() const noexcept;
 
   EventLoop& _loop;
   const std::string _label;
@@ -69,14 +85,15 @@ class SourceState : public std::enable_shared_from_this<SourceState> {
   SourceState(const SourceState&) = delete;
   SourceState& operator=(const SourceState&) = delete;
 
-  void arm();     ///< Waits for the next event, unless cancelled.
+  void arm();  ///< Waits for the next event, unless cancelled. Throws std::bad_alloc.
+  void rearm() noexcept;
   void cancel();  ///< Any thread.
   void drop();    ///< Gives up everything without a call; for the end of the loop.
 
  protected:
   virtual void wait() = 0;         ///< With the mutex held.
   virtual void stopWaiting() = 0;  ///< With the mutex held.
-  void fire();                     ///< Calls the handler on the queue, then waits again.
+  void fire() noexcept;            ///< Calls the handler on the queue, then waits again.
   [[nodiscard]] AsioSerialQueue& queue() const { return *_queue; }
   template <class Derived>
   [[nodiscard]] std::shared_ptr<Derived> self() {

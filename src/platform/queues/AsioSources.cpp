@@ -1,6 +1,7 @@
 #include <algorithm>
 #include <asio/io_context.hpp>
 #include <asio/steady_timer.hpp>
+#include <new>
 #include <utility>
 
 #include "platform/queues/AsioSerialQueue.h"
@@ -54,7 +55,7 @@ class DescriptorState final : public SourceState {
       if (outcome == DescriptorTable::Outcome::Ready) {
         state->fire();
       } else {
-        state->arm();
+        state->rearm();
       }
     });
   }
@@ -66,24 +67,41 @@ class DescriptorState final : public SourceState {
 
 class SourceHandle final : public Source {
  public:
-  explicit SourceHandle(std::shared_ptr<SourceState> state) : _state(std::move(state)) {}
-  ~SourceHandle() override { _state->cancel(); }
+  SourceHandle() = default;
+  ~SourceHandle() override {
+    if (_state) _state->cancel();
+  }
   SourceHandle(const SourceHandle&) = delete;
   SourceHandle& operator=(const SourceHandle&) = delete;
 
+  /// Once, when the source has started.
+  void hold(std::shared_ptr<SourceState> state) { _state = std::move(state); }
   void cancel() override { _state->cancel(); }
 
  private:
-  const std::shared_ptr<SourceState> _state;
+  std::shared_ptr<SourceState> _state;
 };
 
+void forgetSource(EventLoop& loop, const std::shared_ptr<SourceState>& state) {
+  const std::lock_guard lock(loop.sourcesMutex);
+  loop.sources.erase(state);
+}
+
 std::unique_ptr<Source> startSource(EventLoop& loop, std::shared_ptr<SourceState> state) {
+  auto handle = std::make_unique<SourceHandle>();
   {
     const std::lock_guard lock(loop.sourcesMutex);
     loop.sources.insert(state);
   }
-  state->arm();
-  return std::make_unique<SourceHandle>(std::move(state));
+  try {
+    state->arm();
+  } catch (const std::bad_alloc&) {
+    forgetSource(loop, state);
+    state->drop();  // Its maker hears of the failure, and the cancel handler does not.
+    throw;
+  }
+  handle->hold(std::move(state));
+  return handle;
 }
 
 }  // namespace
@@ -96,11 +114,17 @@ void SourceState::arm() {
   if (!_cancelled) wait();
 }
 
-void SourceState::fire() {
-  _queue->dispatch([state = shared_from_this()] {
-    if (state->_cancelled) return;
-    state->_handler();
-    state->arm();
+void SourceState::rearm() noexcept {
+  _queue->mustHaveMemory([this] { arm(); });
+}
+
+void SourceState::fire() noexcept {
+  _queue->mustHaveMemory([this] {
+    _queue->dispatch([state = shared_from_this()] {
+      if (state->_cancelled) return;
+      state->_queue->run(state->_handler);
+      state->rearm();
+    });
   });
 }
 
@@ -111,14 +135,13 @@ void SourceState::cancel() {
     stopWaiting();
   }
   const auto keptAlive = shared_from_this();
-  {
-    const std::lock_guard lock(_queue->loop().sourcesMutex);
-    _queue->loop().sources.erase(keptAlive);
-  }
+  forgetSource(_queue->loop(), keptAlive);
   // The handler may be under way: only the queue knows when it is safe to drop it.
-  _queue->async([keptAlive] {
-    keptAlive->_handler = {};
-    if (const auto cancelHandler = std::exchange(keptAlive->_cancelHandler, {})) cancelHandler();
+  _queue->mustHaveMemory([&] {
+    _queue->async([keptAlive] {
+      keptAlive->_handler = {};
+      if (const auto cancelHandler = std::exchange(keptAlive->_cancelHandler, {})) cancelHandler();
+    });
   });
 }
 

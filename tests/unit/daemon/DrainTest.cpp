@@ -1,6 +1,7 @@
 #include "daemon/Drain.h"
 
 #include "AgentFixture.h"
+#include "unit/backends/dashboard/LoopbackDashboard.h"
 
 namespace tallyd {
 namespace {
@@ -89,7 +90,35 @@ TEST(BalanceLineTest, LeavesTheReasonsOutWhenNothingWasDropped) {
   EXPECT_EQ(balanceLine({}), "Drained: accepted 0, sent 0, dropped 0, not finished 0.");
 }
 
-using AgentDrainTest = AgentFixture;
+class AgentDrainTest : public AgentFixture {
+ protected:
+  struct Outcome {
+    std::optional<Drain::End> end;
+    std::string balance;
+  };
+  /// A session with a dashboard from which nothing is heard; what a drain of this time comes to.
+  Outcome drained(std::chrono::seconds time) {
+    const test::LoopbackDashboard dashboard;
+    const Dictionary entry{{"ip", "127.0.0.1"}, {"port", dashboard.port()}, {"reliable", 8000}};
+    const std::string body = fakes::StorebagSigner::server().envelope(
+        Dictionary{{"version", "1"}, {"release", Dictionary{{"dashboard", entry}}}});
+    fake.http.answer = [&body](const auto&) { return fakes::FakeHTTPClient::ok(body); };
+    const auto ledger = std::make_shared<Ledger>();
+    TallydAgent draining(platform, ledger);
+    auto connection = std::make_shared<fakes::FakeServiceConnection>();
+    draining.shouldAcceptNewConnection(connection);
+    configure(connection, 1, 5);
+    connection->call("StartConfig");
+    draining.endSessions();
+    Outcome outcome;
+    Drain drain(fake.queues, *ledger);
+    drain.start(time, [&outcome](Drain::End how) { outcome.end = how; });
+    fake.queues.advance(time);
+    outcome.balance = balanceLine(ledger->totals());
+    fake.queues.advance(20s);  // The daemon would have ended; here what waits is to go.
+    return outcome;
+  }
+};
 
 TEST_F(AgentDrainTest, EndsEverySessionAsIfItsClientHadLeft) {
   std::vector<Connection> connections;
@@ -126,6 +155,15 @@ TEST_F(AgentDrainTest, ALedgerIsSettledOnceTheSessionsHaveEndedAndTheirPostsAreD
   fake.queues.run();
   EXPECT_TRUE(ledger->isSettled());
   EXPECT_EQ(balanceLine(ledger->totals()), "Drained: accepted 2, sent 2, dropped 0, not finished 0.");
+}
+
+TEST_F(AgentDrainTest, DatagramsThatNobodyAcknowledgesAreGivenUpWithinEighteenSeconds) {
+  const Outcome enough = drained(18s);
+  EXPECT_EQ(enough.end, Drain::End::Settled);
+  EXPECT_EQ(enough.balance, "Drained: accepted 2, sent 0, dropped 2 (clean-up 2), not finished 0.");
+  const Outcome tooLittle = drained(17s);
+  EXPECT_EQ(tooLittle.end, Drain::End::TimeOver);
+  EXPECT_EQ(tooLittle.balance, "Drained: accepted 2, sent 0, dropped 0, not finished 2.");
 }
 
 class AgentOptionsTest : public AgentFixture {};

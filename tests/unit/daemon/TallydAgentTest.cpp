@@ -52,6 +52,22 @@ TEST_F(TallydAgentTest, AcceptanceCountsTheSessionsBeforeTheNewOne) {
   EXPECT_EQ(counts(), "2(0)");
 }
 
+TEST_F(TallydAgentTest, AConnectionForWhichThereIsNoMemoryIsRefusedAndForgotten) {
+  const auto ledger = std::make_shared<Ledger>();
+  TallydAgent booking(platform, ledger);
+  auto connection = std::make_shared<fakes::FakeServiceConnection>();
+  connection->hasNoMemory = true;
+  EXPECT_FALSE(booking.shouldAcceptNewConnection(connection));
+  EXPECT_TRUE(fake.log.has(platform::LogLevel::Critical, "No memory for a new connection"));
+  EXPECT_EQ(ledger->snapshot().dictionary("connections")->integer("open"), 0);
+  connection.reset();
+  EXPECT_TRUE(ledger->isSettled());
+  fake.log.clear();
+  EXPECT_TRUE(booking.shouldAcceptNewConnection(std::make_shared<fakes::FakeServiceConnection>()));
+  EXPECT_EQ(fake.log.lines().at(0),
+            debug("Accepting new XPC connection client 1 of user 0, 0(0) connections."));
+}
+
 TEST_F(TallydAgentTest, EachConnectionHasASessionOfItsOwn) {
   const Connection first = connect();
   const Connection second = connect();

@@ -3,6 +3,7 @@
 
 #include <map>
 #include <memory>
+#include <new>
 #include <string>
 #include <vector>
 
@@ -24,6 +25,7 @@ class ScriptedBackends {
     std::int32_t state = ReportingStateOn;  ///< What updateState decides.
     std::int32_t hierarchy = 0;             ///< Taken when the state is updated.
     std::optional<std::string> displayURL{};
+    std::string throwsAt{};  ///< The operation, as in the trace, that finds no memory.
   };
   /// One call of the factory.
   struct Request {
@@ -102,7 +104,10 @@ class ScriptedBackend final : public TallyBackend {
 
  private:
   [[nodiscard]] const ScriptedBackends::Script& script() const { return _all.scripts.at(name()); }
-  void note(const std::string& operation) { _all.trace.push_back(name() + ": " + operation); }
+  void note(const std::string& operation) {
+    _all.trace.push_back(name() + ": " + operation);
+    if (operation == script().throwsAt) throw std::bad_alloc();
+  }
 
   ScriptedBackends& _all;
 };

@@ -308,6 +308,23 @@ TEST_F(TallydSessionTest, TheEndSendsTheStopRecordThenFlushesThenCleansUp) {
                    debug("Sent internal message (method:0 respCode:1)")}));
 }
 
+TEST_F(TallydSessionTest, WhatThrowsAtTheEndIsLeftOutAndTheRestIsDone) {
+  const std::map<std::string, std::string> steps{
+      {"message 0/1", "stop record"}, {"flush", "flush"}, {"cleanup", "clean-up"}};
+  for (const auto& [operation, step] : steps) {
+    backends.scripts["dashboard"].throwsAt = operation;
+    backends.scripts["splunk"];
+    startedSession().reset();
+    EXPECT_EQ(traceWithoutEnds(), (Texts{"dashboard: message 0/1", "splunk: message 0/1", "dashboard: flush",
+                                         "splunk: flush", "dashboard: cleanup", "splunk: cleanup"}));
+    const std::string reason = std::bad_alloc().what();
+    EXPECT_EQ(fake.log.count(platform::LogLevel::Critical,
+                             "TallydSession: " + step + " of session 7 left out: " + reason),
+              1U);
+    forget();
+  }
+}
+
 TEST_F(TallydSessionTest, TheStopRecordIsSentEvenWhenItIsEmpty) {
   backends.scripts["splunk"];
   auto session = startedSession();

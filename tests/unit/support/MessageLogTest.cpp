@@ -4,10 +4,27 @@
 #include <sys/stat.h>
 
 #include <fstream>
+#include <new>
 #include <sstream>
 #include <thread>
 
 #include "fakes/FakePlatform.h"
+
+namespace {
+
+/// What takes more memory to write than there is.
+struct TooLarge {};
+
+}  // namespace
+
+template <>
+struct fmt::formatter<TooLarge> {
+  constexpr auto parse(format_parse_context& context) { return context.begin(); }
+  template <class Context>
+  auto format(const TooLarge&, Context&) const -> decltype(std::declval<Context>().out()) {
+    throw std::bad_alloc();
+  }
+};
 
 namespace tallyd {
 namespace {
@@ -82,6 +99,14 @@ TEST_F(MessageLogTest, MakesDirectoryAndFileAtTheFirstCall) {
   EXPECT_EQ(texts[2], "Searching for existing tallyd log file in " + folder());
   EXPECT_TRUE(texts[3].starts_with("Created new tallyd log file " + path(currentName()) + " (")) << texts[3];
   EXPECT_EQ(texts[4], "Saved log message to " + path(currentName()));
+}
+
+TEST_F(MessageLogTest, LosesALineForWhichThereIsNoMemoryAndNoOther) {
+  log.writeMessageLog("one");
+  log.writeMessageLog("{}", TooLarge());
+  log.writeMessageLog("three");
+  EXPECT_EQ(read(path(currentName())), "(" + now() + ") one\n(" + now() + ") three\n");
+  EXPECT_TRUE(logged(LogLevel::Critical, "No memory for a line of the tallyd log file"));
 }
 
 TEST_F(MessageLogTest, StampsALineWithDateTimeAndOffset) {

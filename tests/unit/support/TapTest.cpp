@@ -5,9 +5,11 @@
 
 #include <chrono>
 #include <csignal>
+#include <new>
 #include <optional>
 
 #include "fakes/FakeClock.h"
+#include "fakes/FakeQueues.h"
 #include "fakes/TemporaryFolder.h"
 #include "platform/JSON.h"
 #include "platform/queues/AsioQueues.h"
@@ -195,6 +197,32 @@ TEST_F(TapTest, ShowsDropsWithTheirOwnerAndMessage) {
   EXPECT_EQ(drop.string("reason"), "clean-up");
   EXPECT_EQ(drop.integer("count"), 7);
   EXPECT_FALSE(drop.contains("method"));
+}
+
+TEST_F(TapTest, CountsALineForWhichThereIsNoMemoryAsMissed) {
+  TapEnd reader;
+  const auto subscription = tap->listen(std::move(reader.writing));
+  const Account account({.session = 1}, tap);
+  account.show("large", [](TapLine&) { throw std::bad_alloc(); });
+  account.show("small", [](TapLine&) {});
+  const Dictionary missed = parsed(reader.next().value_or(""));
+  EXPECT_EQ(missed.string("kind"), "missed");
+  EXPECT_EQ(missed.integer("count"), 1);
+  EXPECT_EQ(parsed(reader.next().value_or("")).string("kind"), "small");
+}
+
+TEST(TapMemoryTest, WritesWithTheNextLineWhatItsQueueHadNoMemoryFor) {
+  fakes::FakeQueues queues;
+  const fakes::FakeClock clock;
+  const auto tap = std::make_shared<Tap>(queues, clock);
+  TapEnd reader;
+  const auto subscription = tap->listen(std::move(reader.writing));
+  queues.refuseWork(1);
+  tap->write(tap->line("first"));
+  tap->write(tap->line("second"));
+  queues.run();
+  EXPECT_EQ(parsed(reader.next().value_or("")).string("kind"), "first");
+  EXPECT_EQ(parsed(reader.next().value_or("")).string("kind"), "second");
 }
 
 TEST_F(TapTest, AsksNobodyToDescribeWhatNobodySees) {

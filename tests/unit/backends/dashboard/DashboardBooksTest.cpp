@@ -5,7 +5,9 @@
 #include <random>
 
 #include "DashboardFixture.h"
+#include "FailingAllocation.h"
 #include "backends/dashboard/DatagramSender.h"
+#include "backends/dashboard/LocalLog.h"
 #include "support/Account.h"
 
 namespace tallyd {
@@ -29,6 +31,7 @@ class DashboardBooksTest : public DashboardFixture {
   }
   [[nodiscard]] AccountCounts counts() const { return account->counts(); }
 
+  const Lines kNoMemory{{Level::Error, "Tally (DashboardBackend): can't malloc."}};
   std::shared_ptr<Account> account = std::make_shared<Account>();
 };
 
@@ -83,6 +86,49 @@ TEST_F(DashboardBooksTest, TheOldestOfTheFiftyFirstGoes) {
   fake.queues.run();
   EXPECT_EQ(droppedFor(counts(), DropReason::QueueFull), 3U);
   EXPECT_EQ(counts().inFlight, 50U);
+  expectBalance();
+}
+
+TEST_F(DashboardBooksTest, ADatagramForWhichTheQueueHasNoMemoryIsDropped) {
+  const auto backend = booked(profile());
+  fake.queues.refuseWork(1);
+  EXPECT_EQ(backend->sendMessage(Dictionary{{"a", 1}}, kTime, 1, 0, 1), std::nullopt);
+  EXPECT_EQ(droppedFor(counts(), DropReason::OutOfMemory), 1U);
+  EXPECT_EQ(fake.log.lines(), kNoMemory);
+  send(*backend, 2);
+  fake.queues.run();
+  EXPECT_EQ(receivedEventIDs(), std::vector<std::uint16_t>{2});
+  EXPECT_EQ(counts().sent, 1U);
+  expectBalance();
+}
+
+TEST_F(DashboardBooksTest, ADatagramWithoutMemoryForItsLineIsDropped) {
+  const auto backend = booked(profile());
+  const std::string broken(kDatagramDeviceIDBytes, '\xFF');  // Becomes longer, and the line with it.
+  backend->setUdid(broken.c_str());
+  const Dictionary payload{{"a", std::string(1000, 'x')}};
+  {
+    const test::FailingAllocation failing(kMaximumLocalLogBytes + 100);
+    EXPECT_EQ(backend->sendMessage(payload, kTime, 1, 0, 1), std::nullopt);
+  }
+  EXPECT_EQ(droppedFor(counts(), DropReason::OutOfMemory), 1U);
+  EXPECT_EQ(fake.log.lines(), kNoMemory);
+  fake.queues.run();
+  EXPECT_TRUE(receivedEventIDs().empty());
+  expectBalance();
+}
+
+TEST_F(DashboardBooksTest, ADatagramThatCannotBeKeptForItsAcknowledgementIsDropped) {
+  const auto backend = booked(reliableProfile());
+  send(*backend, 1, std::string(2000, 'x'));
+  {
+    const test::FailingAllocation failing(kDatagramBufferBytes - 1);
+    fake.queues.run();
+  }
+  EXPECT_EQ(droppedFor(counts(), DropReason::OutOfMemory), 1U);
+  EXPECT_EQ(fake.log.lines(), kNoMemory);
+  fake.queues.advance(kPeriod * 20);
+  EXPECT_EQ(receivedEventIDs(), std::vector<std::uint16_t>{1});
   expectBalance();
 }
 

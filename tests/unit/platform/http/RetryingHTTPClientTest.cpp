@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <deque>
+#include <new>
 #include <random>
 
 #include "fakes/FakeClock.h"
@@ -261,6 +262,61 @@ TEST_F(RetryingHTTPClientTest, WhatIsUnderWayAtItsEndGetsNoFurtherAttempt) {
   answers = {FakeHTTPClient::failure("refused")};
   post();
   client.reset();
+  queues.advance(60s);
+  ASSERT_EQ(results.size(), 1U);
+  EXPECT_EQ(results[0].error, "refused");
+  EXPECT_EQ(attempts(), 1U);
+}
+
+TEST_F(RetryingHTTPClientTest, AFirstAttemptThatFindsNoMemoryIsNotTakenAndHoldsNothing) {
+  makeClient(3, 1'000'000);
+  inner.answer = [](const HTTPRequest&) -> HTTPResult { throw std::bad_alloc(); };
+  EXPECT_THROW(post(std::string(900'000, 'x')), std::bad_alloc);
+  queues.advance(15min);
+  EXPECT_TRUE(results.empty());
+  inner.answer = [](const HTTPRequest&) { return FakeHTTPClient::ok(""); };
+  post(std::string(900'000, 'x'));
+  queues.run();
+  ASSERT_EQ(results.size(), 1U);
+  EXPECT_EQ(results[0].error, std::nullopt);
+}
+
+TEST_F(RetryingHTTPClientTest, AFurtherAttemptThatFindsNoMemoryIsTheLast) {
+  makeClient(3);
+  inner.answer = [this](const HTTPRequest&) {
+    if (attempts() > 1) throw std::bad_alloc();
+    return FakeHTTPClient::failure("refused");
+  };
+  post();
+  queues.advance(15min);
+  ASSERT_EQ(results.size(), 1U);
+  EXPECT_EQ(results[0].error, "out of memory (https://collect.example/in)");
+  EXPECT_EQ(attempts(), 2U);
+}
+
+TEST_F(RetryingHTTPClientTest, WithoutMemoryForTheWaitThereIsNoFurtherAttempt) {
+  makeClient(3);
+  answers = {FakeHTTPClient::failure("refused")};
+  post();
+  queues.refuseTimers(true);
+  queues.run();
+  ASSERT_EQ(results.size(), 1U);
+  EXPECT_EQ(results[0].error, "refused");
+  queues.refuseTimers(false);
+  client.reset();
+  queues.advance(15min);
+  EXPECT_EQ(results.size(), 1U);
+}
+
+TEST_F(RetryingHTTPClientTest, WhatCannotBeToldAtItsEndIsToldWhenItsWaitIsOver) {
+  makeClient(3);
+  answers = {FakeHTTPClient::failure("refused")};
+  post();
+  queues.run();
+  queues.refuseWork(1);
+  client.reset();
+  queues.run();
+  EXPECT_TRUE(results.empty());
   queues.advance(60s);
   ASSERT_EQ(results.size(), 1U);
   EXPECT_EQ(results[0].error, "refused");

@@ -134,6 +134,31 @@ TEST_F(SynchronousRequestTest, ReusesItsConnection) {
   EXPECT_EQ(server.connectionCount(), 1U);
 }
 
+TEST_F(SynchronousRequestTest, IsNotChangedByTheRequestBeforeIt) {
+  const LoopbackServer server;
+  const RawServer silent([](RawConnection& connection) { connection.waitForClose(); });
+  const auto client = makeClient({.stallTime = std::chrono::seconds(1)});
+  HTTPRequest hurried = post(silent.url(), "{}");
+  hurried.timeout = std::chrono::milliseconds(50);
+  EXPECT_THAT(errorOf(client->sendSynchronousRequest(hurried)), HasSubstr("timed out"));
+  EXPECT_THAT(errorOf(client->sendSynchronousRequest(get(silent.url()))), HasSubstr("too slow"));
+
+  const std::vector<std::pair<std::string, std::string>> requests{
+      {"PUT", "a file"}, {"GET", ""},  {"DELETE", ""}, {"POST", "events"},
+      {"HEAD", ""},      {"POST", ""}, {"GET", ""}};
+  for (const auto& [method, body] : requests) {
+    HTTPRequest request = get(server.url());
+    request.method = method;
+    request.body = Data(body);
+    if (method == "PUT") request.headers = {{"X-Once", "1"}};
+    EXPECT_EQ(statusOf(client->sendSynchronousRequest(request)), 200) << method;
+    const ReceivedRequest received = server.requests().back();
+    EXPECT_EQ(received.method, method);
+    EXPECT_EQ(received.body, body) << method;
+    EXPECT_EQ(received.header("X-Once").has_value(), method == "PUT") << method;
+  }
+}
+
 TEST_F(SynchronousRequestTest, ServesManyThreadsAtOnce) {
   const LoopbackServer server([](const ReceivedRequest& request) {
     return ServedResponse{200, request.target};

@@ -4,10 +4,13 @@
 
 #include <atomic>
 #include <memory>
+#include <new>
+#include <stdexcept>
 #include <thread>
 #include <vector>
 
 #include "Gate.h"
+#include "fakes/FakeLog.h"
 #include "platform/queues/GrowingPool.h"
 
 namespace tallyd::platform {
@@ -104,6 +107,46 @@ TEST(AsioQueuesTest, DropsWorkThatHasNotStartedAtTheEnd) {
     EXPECT_EQ(held.use_count(), 2);
   }
   EXPECT_EQ(held.use_count(), 1);
+}
+
+void throwOften(SerialQueue& queue) {
+  queue.async([] { throw std::runtime_error("a reason"); });
+  queue.async([] { throw std::bad_alloc(); });
+  queue.async([] { throw 7; });
+  queue.asyncAfter(std::chrono::milliseconds(1), [] { throw std::runtime_error("later"); });
+}
+
+TEST(AsioQueuesTest, GivesUpWorkThatThrowsAndGoesOnWhereThatIsLogged) {
+  fakes::FakeLog log;
+  AsioQueues queues(1, &log);
+  const auto queue = queues.makeSerialQueue("com.quillon.test");
+  Gate done;
+  throwOften(*queue);
+  queue->async([&] { done.pass(); });
+  ASSERT_TRUE(done.waitFor(1));
+  queue->asyncAfter(std::chrono::milliseconds(2), [&] { done.pass(); });
+  ASSERT_TRUE(done.waitFor(2));
+  const auto critical = [](std::string text) {
+    return fakes::FakeLog::Line{LogLevel::Critical, std::move(text)};
+  };
+  EXPECT_EQ(log.lines(), (std::vector{critical("Gave up work on queue com.quillon.test: a reason"),
+                                      critical(std::string("Gave up work on queue com.quillon.test: ") +
+                                               std::bad_alloc().what()),
+                                      critical("Gave up work on queue com.quillon.test"),
+                                      critical("Gave up work on queue com.quillon.test: later")}));
+}
+
+TEST(AsioQueuesDeathTest, EndsTheProcessForWorkThatThrowsWithoutALog) {
+  GTEST_FLAG_SET(death_test_style, "threadsafe");
+  EXPECT_DEATH(
+      {
+        AsioQueues queues(1);
+        const auto queue = queues.makeSerialQueue("test");
+        Gate never;
+        queue->async([] { throw std::runtime_error("a reason"); });
+        EXPECT_TRUE(never.waitFor(1));
+      },
+      "a reason");
 }
 
 class BlockedQueuesTest : public testing::TestWithParam<std::size_t> {};

@@ -6,9 +6,11 @@
 #include <array>
 #include <atomic>
 #include <memory>
+#include <stdexcept>
 #include <vector>
 
 #include "Gate.h"
+#include "fakes/FakeLog.h"
 #include "platform/FileDescriptor.h"
 #include "platform/queues/AsioQueues.h"
 
@@ -140,6 +142,35 @@ TEST_F(AsioSourcesTest, ReadAndWriteSourcesShareADescriptor) {
   sendByte();
   EXPECT_TRUE(reads.waitFor(2));
   stop(reading);
+}
+
+TEST_F(AsioSourcesTest, AHandlerThatThrowsIsCalledAgain) {
+  fakes::FakeLog log;
+  AsioQueues queues(1, &log);
+  const auto queue = queues.makeSerialQueue("com.quillon.test");
+  Gate ticks;
+  auto timer = queue->makeTimer(1ms, 1ms, [&] {
+    ticks.pass();
+    throw std::runtime_error("a tick");
+  });
+  EXPECT_TRUE(ticks.waitFor(3));
+  timer.reset();
+  Gate reads;
+  auto source = queue->makeReadSource(_here.get(), [&] {
+    takeByte();
+    reads.pass();
+    throw std::runtime_error("a byte");
+  });
+  for (int bytes = 1; bytes <= 3; ++bytes) {
+    sendByte();
+    EXPECT_TRUE(reads.waitFor(bytes));
+  }
+  source.reset();
+  Gate done;
+  queue->async([&] { done.pass(); });
+  ASSERT_TRUE(done.waitFor(1));
+  EXPECT_GE(log.count(LogLevel::Critical, "Gave up work on queue com.quillon.test: a tick"), 3U);
+  EXPECT_EQ(log.count(LogLevel::Critical, "Gave up work on queue com.quillon.test: a byte"), 3U);
 }
 
 TEST_F(AsioSourcesTest, NoHandlerStartsAfterTheQueueItselfCancelled) {
