@@ -23,7 +23,8 @@ class CurlHTTPClient::Implementation {
         _limits(limits),
         _anchors(root.under(kAdditionalAuthorities), log),
         _environment{_share, _anchors, _limits},
-        _handles(limits.maximumIdleHandles),
+        _handles(limits.maximumIdleHandles,
+                 [this](CURL* handle) { return CurlTransfer::configure(handle, _environment); }),
         _engine(_environment) {}
 
   HTTPResult sendSynchronousRequest(const HTTPRequest& request) {

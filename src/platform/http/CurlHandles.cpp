@@ -29,24 +29,27 @@ void CurlShare::unlock(CURL*, curl_lock_data data, void* self) {
   static_cast<CurlShare*>(self)->_mutexes[static_cast<std::size_t>(data)].unlock();
 }
 
+CurlHandlePool::CurlHandlePool(std::size_t maximumIdle, std::function<bool(CURL*)> configure)
+    : _maximumIdle(maximumIdle), _configure(std::move(configure)) {
+  _idle.reserve(maximumIdle);
+}
+
 CurlEasy CurlHandlePool::take() {
   {
     const std::lock_guard lock(_mutex);
     if (!_idle.empty()) {
       CurlEasy handle = std::move(_idle.back());
       _idle.pop_back();
-      // Once more: the defaults take memory, and libcurl does not tell when it had none. Whoever lacks it now
-      // fails for itself.
-      curl_easy_reset(handle.get());
       return handle;
     }
   }
-  return CurlEasy(curl_easy_init());
+  CurlEasy handle(curl_easy_init());
+  if (handle && !_configure(handle.get())) handle.reset();
+  return handle;
 }
 
 void CurlHandlePool::giveBack(CurlEasy handle) {
   if (!handle) return;
-  curl_easy_reset(handle.get());
   const std::lock_guard lock(_mutex);
   if (_idle.size() < _maximumIdle) _idle.push_back(std::move(handle));
 }

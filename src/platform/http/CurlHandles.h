@@ -5,6 +5,7 @@
 
 #include <array>
 #include <cstddef>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <vector>
@@ -49,19 +50,24 @@ class CurlShare {
   std::array<std::mutex, CURL_LOCK_DATA_LAST> _mutexes;
 };
 
-/// Easy handles between two uses. A handle keeps the connections that it made itself.
+/// Easy handles between two uses. A handle keeps the connections that it made itself, and its options:
+/// putting them back takes memory, and a handle that lacked it would spoil the request after the next.
 ///
 /// Threading: any thread; one handle belongs to one user at a time.
 class CurlHandlePool {
  public:
-  explicit CurlHandlePool(std::size_t maximumIdle) : _maximumIdle(maximumIdle) { _idle.reserve(maximumIdle); }
+  /// @param configure  sets what all users of the handles want; false when that fails. Each handle hears of
+  /// it
+  ///                   once.
+  CurlHandlePool(std::size_t maximumIdle, std::function<bool(CURL*)> configure);
 
-  /// A handle with every option at its default; null when memory runs out.
+  /// A configured handle, whose other options are those of its last user; null when memory runs out.
   [[nodiscard]] CurlEasy take();
-  void giveBack(CurlEasy handle);  ///< Throws nothing.
+  void giveBack(CurlEasy handle);  ///< Takes no memory.
 
  private:
   const std::size_t _maximumIdle;
+  const std::function<bool(CURL*)> _configure;
   std::mutex _mutex;
   std::vector<CurlEasy> _idle;
 };

@@ -28,6 +28,15 @@ ParsedURL parseURL(const std::string& text) {
   return url;
 }
 
+/// Asked again for the same URL, as of one post after the other, it remembers.
+bool isURL(const std::string& text) {
+  thread_local std::string known;
+  if (text == known && !known.empty()) return true;
+  if (!parseURL(text)) return false;
+  known = text;
+  return true;
+}
+
 std::string urlPart(CURLU* url, CURLUPart part) {
   char* text = nullptr;
   if (curl_url_get(url, part, &text, 0) != CURLUE_OK) return {};
@@ -125,9 +134,34 @@ CurlTransfer::CurlTransfer(CurlEasy handle, HTTPRequest request, ResponseBody re
       _responseBody(responseBody),
       _environment(environment) {}
 
+bool CurlTransfer::configure(CURL* handle, const CurlEnvironment& environment) {
+  Options options(handle);
+  options.set(CURLOPT_NOSIGNAL, 1L);
+  options.set(CURLOPT_USERAGENT, "tallyd");
+  options.set(CURLOPT_SHARE, environment.share.get());
+  options.set(CURLOPT_TCP_KEEPALIVE, 1L);
+  options.set(CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_2TLS));
+  options.set(CURLOPT_PROTOCOLS_STR, kSchemes);
+  options.set(CURLOPT_REDIR_PROTOCOLS_STR, kSchemes);
+  options.set(CURLOPT_FOLLOWLOCATION, 1L);
+  options.set(CURLOPT_MAXREDIRS, static_cast<long>(environment.limits.maximumRedirects));
+  // The anchors come from the shared store; libcurl's own way would read the whole bundle for each
+  // connection.
+  options.set(CURLOPT_CAINFO, static_cast<char*>(nullptr));
+  options.set(CURLOPT_CAPATH, static_cast<char*>(nullptr));
+  options.set(CURLOPT_SSL_VERIFYPEER, 1L);
+  options.set(CURLOPT_SSL_VERIFYHOST, 2L);
+  options.set(CURLOPT_SSL_CTX_FUNCTION, &CurlTransfer::onTLSContext);
+  options.set(CURLOPT_SSL_CTX_DATA, &environment.anchors);
+  options.set(CURLOPT_WRITEFUNCTION, &CurlTransfer::onBody);
+  options.set(CURLOPT_HEADERFUNCTION, &CurlTransfer::onHeader);
+  options.set(CURLOPT_PREREQFUNCTION, &CurlTransfer::onStart);
+  return options.code() == CURLE_OK;
+}
+
 std::optional<std::string> CurlTransfer::prepare() {
   if (!_handle) throw std::bad_alloc();
-  if (!parseURL(_request.url)) return "bad URL";
+  if (!isURL(_request.url)) return "bad URL";
   if (!isToken(_request.method)) return "bad method";
   if (_request.method == "GET" && !_request.body.empty()) return "a GET request can't carry a body";
   if (auto problem = prepareHeaders()) return problem;
@@ -137,9 +171,11 @@ std::optional<std::string> CurlTransfer::prepare() {
   options.set(CURLOPT_ERRORBUFFER, _error.data());
   options.set(CURLOPT_HTTPHEADER, _headers.get());
   setMethod(options);
-  setConnection(options);
+  // Waiting for a connection under way to turn out multiplexed beats opening one for each post of a burst.
+  options.set(CURLOPT_PIPEWAIT, isHTTPS(_request.url) ? 1L : 0L);
+  options.set(CURLOPT_FRESH_CONNECT, 0L);
   setTimes(options);
-  setCallbacks(options);
+  setUser(options);
   if (options.code() == CURLE_OUT_OF_MEMORY) throw std::bad_alloc();
   if (options.code() != CURLE_OK) return curl_easy_strerror(options.code());
   return std::nullopt;
@@ -173,10 +209,11 @@ std::optional<std::string> CurlTransfer::prepareHeaders() {
 
 void CurlTransfer::setMethod(Options& options) {
   const std::string& method = _request.method;
-  if (method == "GET") {
-    options.set(CURLOPT_HTTPGET, 1L);
-    return;
-  }
+  // What the handle's last request was; setting the fields makes it a POST.
+  options.set(CURLOPT_CUSTOMREQUEST, static_cast<char*>(nullptr));
+  options.set(CURLOPT_POSTFIELDS, static_cast<char*>(nullptr));
+  options.set(CURLOPT_HTTPGET, 1L);
+  if (method == "GET") return;
   if (method == "HEAD") {
     options.set(CURLOPT_NOBODY, 1L);
     return;
@@ -191,48 +228,20 @@ void CurlTransfer::setMethod(Options& options) {
   if (method != "POST") options.set(CURLOPT_CUSTOMREQUEST, method.c_str());
 }
 
-void CurlTransfer::setConnection(Options& options) {
-  options.set(CURLOPT_NOSIGNAL, 1L);
-  options.set(CURLOPT_USERAGENT, "tallyd");
-  options.set(CURLOPT_SHARE, _environment.share.get());
-  options.set(CURLOPT_TCP_KEEPALIVE, 1L);
-  options.set(CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_2TLS));
-  // Waiting for a connection under way to turn out multiplexed beats opening one for each post of a burst.
-  options.set(CURLOPT_PIPEWAIT, isHTTPS(_request.url) ? 1L : 0L);
-  options.set(CURLOPT_PROTOCOLS_STR, kSchemes);
-  options.set(CURLOPT_REDIR_PROTOCOLS_STR, kSchemes);
-  options.set(CURLOPT_FOLLOWLOCATION, 1L);
-  options.set(CURLOPT_MAXREDIRS, static_cast<long>(_environment.limits.maximumRedirects));
-  // The anchors come from the shared store; libcurl's own way would read the whole bundle for each
-  // connection.
-  options.set(CURLOPT_CAINFO, static_cast<char*>(nullptr));
-  options.set(CURLOPT_CAPATH, static_cast<char*>(nullptr));
-  // The defaults; but a handle may have found no memory for its own.
-  options.set(CURLOPT_SSL_VERIFYPEER, 1L);
-  options.set(CURLOPT_SSL_VERIFYHOST, 2L);
-  options.set(CURLOPT_SSL_CTX_FUNCTION, &CurlTransfer::onTLSContext);
-  options.set(CURLOPT_SSL_CTX_DATA, &_environment.anchors);
-}
-
 void CurlTransfer::setTimes(Options& options) {
+  const bool hasTimeout = _request.timeout.count() > 0;
   const std::chrono::milliseconds stall = _environment.limits.stallTime;
-  if (_request.timeout.count() > 0) {
-    options.set(CURLOPT_TIMEOUT_MS, static_cast<long>(_request.timeout.count()));
-    options.set(CURLOPT_CONNECTTIMEOUT_MS, static_cast<long>(_request.timeout.count()));
-    return;
-  }
-  options.set(CURLOPT_CONNECTTIMEOUT_MS, static_cast<long>(stall.count()));
-  options.set(CURLOPT_LOW_SPEED_LIMIT, 1L);
-  options.set(CURLOPT_LOW_SPEED_TIME, static_cast<long>(_environment.limits.stallTime.count()));
+  options.set(CURLOPT_TIMEOUT_MS, static_cast<long>(hasTimeout ? _request.timeout.count() : 0));
+  options.set(CURLOPT_CONNECTTIMEOUT_MS, static_cast<long>((hasTimeout ? _request.timeout : stall).count()));
+  options.set(CURLOPT_LOW_SPEED_LIMIT, hasTimeout ? 0L : 1L);
+  options.set(CURLOPT_LOW_SPEED_TIME,
+              hasTimeout ? 0L : static_cast<long>(_environment.limits.stallTime.count()));
 }
 
-void CurlTransfer::setCallbacks(Options& options) {
+void CurlTransfer::setUser(Options& options) {
   options.set(CURLOPT_PRIVATE, static_cast<void*>(this));
-  options.set(CURLOPT_WRITEFUNCTION, &CurlTransfer::onBody);
   options.set(CURLOPT_WRITEDATA, static_cast<void*>(this));
-  options.set(CURLOPT_HEADERFUNCTION, &CurlTransfer::onHeader);
   options.set(CURLOPT_HEADERDATA, static_cast<void*>(this));
-  options.set(CURLOPT_PREREQFUNCTION, &CurlTransfer::onStart);
   options.set(CURLOPT_PREREQDATA, static_cast<void*>(this));
 }
 
@@ -247,6 +256,16 @@ bool CurlTransfer::prepareSecondAttempt(CURLcode code) {
   _secondAttempt = true;
   _error.front() = '\0';
   return curl_easy_setopt(_handle.get(), CURLOPT_FRESH_CONNECT, 1L) == CURLE_OK;
+}
+
+CurlEasy CurlTransfer::releaseHandle() {
+  if (_handle) {
+    for (const CURLoption pointer :
+         {CURLOPT_ERRORBUFFER, CURLOPT_HTTPHEADER, CURLOPT_POSTFIELDS, CURLOPT_PRIVATE, CURLOPT_WRITEDATA,
+          CURLOPT_HEADERDATA, CURLOPT_PREREQDATA})
+      curl_easy_setopt(_handle.get(), pointer, static_cast<void*>(nullptr));
+  }
+  return std::move(_handle);
 }
 
 HTTPResult CurlTransfer::result(CURLcode code) {

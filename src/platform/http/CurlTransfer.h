@@ -48,7 +48,11 @@ class CurlTransfer {
   CurlTransfer(const CurlTransfer&) = delete;
   CurlTransfer& operator=(const CurlTransfer&) = delete;
 
-  /// Sets every option; what is wrong with the request, or nothing. Throws std::bad_alloc.
+  /// Sets the options that are the same for all requests; false when libcurl refuses one.
+  [[nodiscard]] static bool configure(CURL* handle, const CurlEnvironment& environment);
+
+  /// Sets every option that differs from request to request, on a handle that is configured; what is wrong
+  /// with this one, or nothing. Throws std::bad_alloc.
   [[nodiscard]] std::optional<std::string> prepare();
 
   [[nodiscard]] CURL* handle() const { return _handle.get(); }
@@ -61,17 +65,16 @@ class CurlTransfer {
   /// has not been served (RFC 9112, section 9.3.1).
   [[nodiscard]] bool prepareSecondAttempt(CURLcode code);
   [[nodiscard]] HTTPResult result(CURLcode code);
-  /// The handle back, for another use; last.
-  [[nodiscard]] CurlEasy releaseHandle() { return std::move(_handle); }
+  /// The handle back, for another use; last. It points to nothing of this object any more.
+  [[nodiscard]] CurlEasy releaseHandle();
 
  private:
   class Options;
 
   [[nodiscard]] std::optional<std::string> prepareHeaders();
   void setMethod(Options& options);
-  void setConnection(Options& options);
   void setTimes(Options& options);
-  void setCallbacks(Options& options);
+  void setUser(Options& options);
   [[nodiscard]] HTTPResult failure(CURLcode code) const;
   [[nodiscard]] HTTPResponse response() const;
   [[nodiscard]] bool received(const char* bytes, std::size_t size, ResponseBody use);

@@ -18,9 +18,9 @@ using std::chrono::steady_clock;
 /// How often waiting requests are looked over for those that have waited too long.
 constexpr std::chrono::milliseconds kExpiryPeriod{1000};
 /// How often the queues are offered the completions for which they had no memory.
-constexpr int kTellAgainMs = 100;
+constexpr std::chrono::milliseconds kTellAgainPeriod{100};
 /// With nothing to do the thread only waits to be woken; the figure bounds nothing.
-constexpr int kIdlePollMs = 3'600'000;
+constexpr std::chrono::milliseconds kIdlePeriod = std::chrono::hours(1);
 
 }  // namespace
 
@@ -57,18 +57,18 @@ bool TransferEngine::Inbox::isClosed() const {
 TransferEngine::TransferEngine(const CurlEnvironment& environment)
     : _environment(environment),
       _inbox(environment.limits.maximumPendingBytes),
-      _multi(curl_multi_init()),
-      _pool(environment.limits.maximumIdleHandles) {
+      _pool(environment.limits.maximumIdleHandles,
+            [&environment](CURL* handle) { return CurlTransfer::configure(handle, environment); }) {
   const HTTPLimits& limits = environment.limits;
-  curl_multi_setopt(_multi.get(), CURLMOPT_PIPELINING, static_cast<long>(CURLPIPE_MULTIPLEX));
-  curl_multi_setopt(_multi.get(), CURLMOPT_MAX_HOST_CONNECTIONS,
+  curl_multi_setopt(_loop.multi(), CURLMOPT_PIPELINING, static_cast<long>(CURLPIPE_MULTIPLEX));
+  curl_multi_setopt(_loop.multi(), CURLMOPT_MAX_HOST_CONNECTIONS,
                     static_cast<long>(limits.maximumConnectionsPerHost));
-  curl_multi_setopt(_multi.get(), CURLMOPT_MAXCONNECTS, static_cast<long>(limits.maximumIdleConnections));
+  curl_multi_setopt(_loop.multi(), CURLMOPT_MAXCONNECTS, static_cast<long>(limits.maximumIdleConnections));
 }
 
 TransferEngine::~TransferEngine() {
   _inbox.close();
-  curl_multi_wakeup(_multi.get());
+  _loop.wake();
   if (_thread.joinable()) _thread.join();
 }
 
@@ -83,7 +83,7 @@ void TransferEngine::submit(HTTPRequest request, std::shared_ptr<SerialQueue> qu
   if (!hasThread()) return refuse(job.front(), "no thread for HTTP transfers", HTTPFailure::Transfer);
   switch (_inbox.add(job)) {
     case Inbox::Answer::TakenAsFirst:
-      curl_multi_wakeup(_multi.get());
+      _loop.wake();
       return;
     case Inbox::Answer::Taken:
       return;  // Whoever brought the first has woken the thread.
@@ -118,21 +118,18 @@ void TransferEngine::refuse(Job& job, const std::string& reason, HTTPFailure kin
 void TransferEngine::run() noexcept {
   while (!_inbox.isClosed()) {
     startWaiting();
-    int running = 0;
-    curl_multi_perform(_multi.get(), &running);
+    _loop.turn(patience());
     finishDone();
     expireLate();
     tellSettled();
-    curl_multi_poll(_multi.get(), nullptr, 0, pollTimeoutMs(), nullptr);
   }
   failUnfinished();
 }
 
-int TransferEngine::pollTimeoutMs() const {
-  const bool canStart = !_waiting.empty() && _active.size() < _environment.limits.maximumActiveTransfers;
-  if (canStart) return 0;
-  if (!_settled.empty()) return kTellAgainMs;
-  return _active.empty() ? kIdlePollMs : static_cast<int>(kExpiryPeriod.count());
+/// Until it is time to look at something else than the transfers.
+std::chrono::milliseconds TransferEngine::patience() const {
+  if (!_settled.empty()) return kTellAgainPeriod;
+  return _active.empty() && _waiting.empty() ? kIdlePeriod : kExpiryPeriod;
 }
 
 void TransferEngine::startWaiting() {
@@ -160,13 +157,13 @@ std::optional<std::string> TransferEngine::prepare(Job& job) {
   job.transfer = std::make_unique<CurlTransfer>(_pool.take(), std::move(job.request),
                                                 CurlTransfer::ResponseBody::Drop, _environment);
   if (auto problem = job.transfer->prepare()) return problem;
-  if (curl_multi_add_handle(_multi.get(), job.transfer->handle()) != CURLM_OK) throw std::bad_alloc();
+  if (curl_multi_add_handle(_loop.multi(), job.transfer->handle()) != CURLM_OK) throw std::bad_alloc();
   return std::nullopt;
 }
 
 void TransferEngine::finishDone() {
   int left = 0;
-  while (const CURLMsg* message = curl_multi_info_read(_multi.get(), &left)) {
+  while (const CURLMsg* message = curl_multi_info_read(_loop.multi(), &left)) {
     if (message->msg != CURLMSG_DONE) continue;
     const CURLcode code = message->data.result;
     CURL* const handle = message->easy_handle;
@@ -180,8 +177,8 @@ void TransferEngine::finishDone() {
 
 bool TransferEngine::sendAgain(CURL* handle, CURLcode code, CurlTransfer& transfer) {
   if (!transfer.prepareSecondAttempt(code)) return false;
-  curl_multi_remove_handle(_multi.get(), handle);
-  return curl_multi_add_handle(_multi.get(), handle) == CURLM_OK;
+  curl_multi_remove_handle(_loop.multi(), handle);
+  return curl_multi_add_handle(_loop.multi(), handle) == CURLM_OK;
 }
 
 /// libcurl's own times begin with a connection; this covers the wait for one.
@@ -216,7 +213,7 @@ void TransferEngine::settle(Jobs& from, Jobs::iterator job, const MakeResult& ma
     result = outOfMemory(request);
   }
   if (job->transfer) {
-    curl_multi_remove_handle(_multi.get(), job->transfer->handle());
+    curl_multi_remove_handle(_loop.multi(), job->transfer->handle());
     _pool.giveBack(job->transfer->releaseHandle());
     job->transfer.reset();
   }
@@ -233,8 +230,7 @@ void TransferEngine::failUnfinished() {
   for (Jobs* jobs : {&_active, &_waiting}) {
     while (!jobs->empty()) settle(*jobs, jobs->begin(), goingAway);
   }
-  for (tellSettled(); !_settled.empty(); tellSettled())
-    curl_multi_poll(_multi.get(), nullptr, 0, kTellAgainMs, nullptr);
+  for (tellSettled(); !_settled.empty(); tellSettled()) _loop.turn(kTellAgainPeriod);
 }
 
 /// In order. The first for which its queue has no memory stays, and what is behind it.

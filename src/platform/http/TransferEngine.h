@@ -12,6 +12,7 @@
 #include "platform/HTTPClient.h"
 #include "platform/http/CurlHandles.h"
 #include "platform/http/CurlTransfer.h"
+#include "platform/http/TransferLoop.h"
 
 namespace tallyd::platform {
 
@@ -92,11 +93,11 @@ class TransferEngine {
   void failUnfinished();
   void tellSettled();
   static void tell(const Job& job);
-  [[nodiscard]] int pollTimeoutMs() const;
+  [[nodiscard]] std::chrono::milliseconds patience() const;
 
   const CurlEnvironment& _environment;
   Inbox _inbox;
-  CurlMulti _multi;
+  TransferLoop _loop;
 
   // Only the thread touches these.
   CurlHandlePool _pool;
