@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cmath>
 #include <new>
 #include <system_error>
 
@@ -109,7 +110,7 @@ void MessageLog::writeLine(std::string_view message) {
   }
   // A date alone names no file; a path alone is written to as it is until a later search finds its date.
   if (!file.path) file = createFile();
-  if (file.path) append(*file.path, message);
+  if (file.path) append(file, message);
   remember(file);
 }
 
@@ -123,13 +124,18 @@ void MessageLog::ensureLogDirectory() {
   createDirectories(_directory);
 }
 
-MessageLog::CurrentFile MessageLog::savedFile() {
+MessageLog::CurrentFile MessageLog::savedFile() const {
   CurrentFile file;
   if (const auto path = _platform.defaults.value(kPathKey); path && path->string()) {
     file.path = std::string(*path->string());
   }
   if (const auto created = _platform.defaults.value(kCreationDateKey)) file.created = created->date();
-  if (!file.path || exists(*file.path)) return file;
+  if (!file.path) return file;
+  struct stat facts {};
+  if (::stat(file.path->c_str(), &facts) == 0) {
+    file.identity = {facts.st_dev, facts.st_ino};
+    return file;
+  }
   asl_log(_platform.log, LogLevel::Info, "Saved tallyd log file {} not found - invalidating file path",
           *file.path);
   return {};
@@ -139,8 +145,8 @@ MessageLog::CurrentFile MessageLog::findExistingFile(CurrentFile file) {
   asl_log(_platform.log, LogLevel::Info, "Searching for existing tallyd log file in {}", _directory);
   const auto name = firstListedFile();
   if (!name) return file;
-  file.path = _directory + "/" + *name;
-  file.created = creationDate(*file.path);
+  const std::string path = _directory + "/" + *name;
+  file = {path, creationDate(path)};
   asl_log(_platform.log, LogLevel::Info, "Found existing tallyd log file {} ({})", *file.path,
           describe(file.created));
   return file;
@@ -173,6 +179,7 @@ void MessageLog::retire(const CurrentFile& file) {
           describe(file.created));
   std::error_code ignored;
   if (file.path) std::filesystem::remove(*file.path, ignored);
+  _file.reset();
 }
 
 MessageLog::CurrentFile MessageLog::createFile() {
@@ -189,15 +196,40 @@ MessageLog::CurrentFile MessageLog::createFile() {
   return {path, created};
 }
 
-void MessageLog::append(const std::string& path, std::string_view message) {
-  const std::string line = fmt::format(
-      "({}) {}\n", Value(platform::dateFromTimePoint(_platform.clock.now())).description(), message);
-  const FileDescriptor file(::open(path.c_str(), O_WRONLY | O_APPEND | O_CLOEXEC));
-  if (const int error = file ? writeAll(file.get(), line) : errno) {
-    asl_log(_platform.log, LogLevel::Critical, "Error writing to tallyd log file {}: {}", path,
+void MessageLog::append(const CurrentFile& file, std::string_view message) {
+  const std::string& date = dateText();
+  std::string line;
+  line.reserve(date.size() + message.size() + std::string_view("() \n").size());
+  line.append("(").append(date).append(") ").append(message).append("\n");
+  if (const int error = write(file, line)) {
+    asl_log(_platform.log, LogLevel::Critical, "Error writing to tallyd log file {}: {}", *file.path,
             errorText(error));
   }
-  asl_log(_platform.log, LogLevel::Info, "Saved log message to {}", path);
+  asl_log(_platform.log, LogLevel::Info, "Saved log message to {}", *file.path);
+}
+
+/// 0, or the error's number. The file stays open as long as its path leads to it.
+int MessageLog::write(const CurrentFile& file, std::string_view line) {
+  if (!_file || !file.identity || file.identity != _identity) {
+    _file = FileDescriptor(::open(file.path->c_str(), O_WRONLY | O_APPEND | O_CLOEXEC));
+    struct stat facts {};
+    if (!_file || ::fstat(_file.get(), &facts) != 0) return errno;
+    _identity = {facts.st_dev, facts.st_ino};
+  }
+  const int error = writeAll(_file.get(), line);
+  if (error != 0) _file.reset();
+  return error;
+}
+
+/// Of now; made once a second.
+const std::string& MessageLog::dateText() {
+  const Date now = platform::dateFromTimePoint(_platform.clock.now());
+  const double second = std::floor(now.secondsSince1970);
+  if (_dateText.empty() || second != _dateSecond) {
+    _dateText = Value(now).description();
+    _dateSecond = second;
+  }
+  return _dateText;
 }
 
 void MessageLog::remember(const CurrentFile& file) {

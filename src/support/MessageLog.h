@@ -2,6 +2,7 @@
 #pragma once
 
 #include <fmt/format.h>
+#include <sys/types.h>
 
 #include <chrono>
 #include <filesystem>
@@ -10,6 +11,7 @@
 #include <string_view>
 
 #include "platform/Clock.h"
+#include "platform/FileDescriptor.h"
 
 namespace tallyd::platform {
 struct Platform;
@@ -43,28 +45,41 @@ class MessageLog {
   }
 
  private:
-  /// The file that lines go to; either half may be missing.
+  /// Which file a path leads to.
+  struct Identity {
+    dev_t device;
+    ino_t number;
+    bool operator==(const Identity&) const = default;
+  };
+  /// The file that lines go to; path and date may each be missing.
   struct CurrentFile {
     std::optional<std::string> path;
     std::optional<platform::Date> created;
+    std::optional<Identity> identity{};  ///< Where it was looked for at its path, and found.
   };
 
   void writeFormatted(fmt::string_view format, fmt::format_args arguments);
   void writeLine(std::string_view message);
   void ensureLogDirectory();
-  CurrentFile savedFile();
+  CurrentFile savedFile() const;
   CurrentFile findExistingFile(CurrentFile file);
   /// The first message log file in the directory's listing; creates a directory that is missing.
   std::optional<std::string> firstListedFile();
   bool isExpired(const CurrentFile& file) const;
   void retire(const CurrentFile& file);
   CurrentFile createFile();
-  void append(const std::string& path, std::string_view message);
+  void append(const CurrentFile& file, std::string_view message);
+  [[nodiscard]] int write(const CurrentFile& file, std::string_view line);
+  [[nodiscard]] const std::string& dateText();
   void remember(const CurrentFile& file);
 
   const platform::Platform& _platform;
   const std::string _directory;
   std::mutex _mutex;
+  platform::FileDescriptor _file;  ///< Open from one line to the next, as long as the path leads to it.
+  std::optional<Identity> _identity;
+  double _dateSecond = 0;  ///< Of `_dateText`, since 1970.
+  std::string _dateText;
 };
 
 /// Whether a directory entry is a message log file: "tallyd", anything without "_", and "messageLog.diag",

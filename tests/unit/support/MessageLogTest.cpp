@@ -294,6 +294,35 @@ TEST_F(MessageLogTest, SaysWhenALineCouldNotBeWritten) {
   EXPECT_TRUE(logged(LogLevel::Info, "Saved log message to /dev/full"));
 }
 
+TEST_F(MessageLogTest, WritesToTheFileThatHasTakenTheCurrentOnesPlace) {
+  log.writeMessageLog("one");
+  const auto current = path(currentName());
+  const auto other = folder() + "/other";
+  std::ofstream(other) << "before\n";
+  std::filesystem::rename(other, current);
+  log.writeMessageLog("two");
+  log.writeMessageLog("three");
+  EXPECT_EQ(read(current), "before\n(" + now() + ") two\n(" + now() + ") three\n");
+}
+
+TEST_F(MessageLogTest, LeavesAFileThatWasDeletedBetweenTwoLines) {
+  log.writeMessageLog("one");
+  std::filesystem::remove(path(currentName()));
+  fake.clock.advance(std::chrono::seconds(1));
+  log.writeMessageLog("two");
+  EXPECT_EQ(read(path(currentName())), "(" + now() + ") two\n");
+}
+
+TEST_F(MessageLogTest, StampsLinesOfOneSecondAlikeAndOfTheNextAnew) {
+  log.writeMessageLog("one");
+  const std::string file = path(currentName());
+  const std::string first = now();
+  fake.clock.advance(std::chrono::milliseconds(1000));
+  log.writeMessageLog("two");
+  ASSERT_NE(first, now());
+  EXPECT_EQ(read(file), "(" + first + ") one\n(" + now() + ") two\n");
+}
+
 TEST_F(MessageLogTest, SerialisesCallsOfManyThreads) {
   {
     std::vector<std::jthread> threads;
