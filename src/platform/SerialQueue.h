@@ -36,6 +36,9 @@ class SerialQueue {
   [[nodiscard]] virtual const std::string& label() const = 0;
 
   virtual void async(Work work) = 0;
+  /// As async(), or at once on this thread when the queue has nothing to do: for short work whose order on
+  /// the queue matters, and not its thread. The caller must hold no lock that the work takes.
+  virtual void dispatch(Work work) = 0;
   virtual void asyncAfter(std::chrono::milliseconds delay, Work work) = 0;
 
   /// Calls `handler` after `first` and then every `period`; ticks that come late are not made up for.

@@ -3,6 +3,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <string>
 #include <string_view>
 
@@ -61,16 +62,31 @@ inline void appendUTF8(std::string& text, std::uint32_t codePoint) {
   }
 }
 
+/// How many bytes at the front are ASCII.
+inline std::size_t asciiLength(std::string_view text) {
+  constexpr std::uint64_t kHighBits = 0x8080808080808080;
+  std::size_t length = 0;
+  for (std::uint64_t word = 0; length + sizeof word <= text.size(); length += sizeof word) {
+    std::memcpy(&word, text.data() + length, sizeof word);
+    if ((word & kHighBits) != 0) break;
+  }
+  while (length < text.size() && static_cast<std::uint8_t>(text[length]) < 0x80) ++length;
+  return length;
+}
+
 /// `text` with every broken sequence replaced by U+FFFD.
 inline std::string withBrokenUTF8Replaced(std::string_view text) {
   std::string result;
   result.reserve(text.size());
-  while (!text.empty()) {
+  while (true) {
+    const std::size_t plain = asciiLength(text);
+    result += text.substr(0, plain);
+    text.remove_prefix(plain);
+    if (text.empty()) return result;
     const UTF8Sequence sequence = firstUTF8Sequence(text);
     result += sequence.wellFormed ? text.substr(0, sequence.length) : kReplacementCharacter;
     text.remove_prefix(sequence.length);
   }
-  return result;
 }
 
 /// The first whole characters of `text`, which is UTF-8, in at most `maximumBytes`.

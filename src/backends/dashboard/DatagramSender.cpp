@@ -100,7 +100,7 @@ void DatagramSender::setAccount(std::shared_ptr<Account> account) {
 }
 
 void DatagramSender::send(std::shared_ptr<const Datagram> datagram) {
-  _networkProcQueue->async(
+  _networkProcQueue->dispatch(
       [self = shared_from_this(), datagram = std::move(datagram)] { self->tryToSendMsg(*datagram); });
 }
 

@@ -65,10 +65,13 @@ std::string descriptionForObject(const Value& object) {
 std::string sanitize(std::string_view text) {
   std::string sanitized;
   sanitized.reserve(text.size());
-  for (const char c : text) {
-    if (c == '\n') continue;
-    if (c == '\\' || c == '=') sanitized += '\\';
-    sanitized += c;
+  while (!text.empty()) {
+    const std::size_t plain = std::min(text.find_first_of("\n\\="), text.size());
+    sanitized += text.substr(0, plain);
+    text.remove_prefix(plain);
+    if (text.empty()) break;
+    if (text[0] != '\n') sanitized.append({'\\', text[0]});
+    text.remove_prefix(1);
   }
   return sanitized.empty() ? "empty" : sanitized;
 }

@@ -43,6 +43,8 @@ class AsioSerialQueue final : public SerialQueue, public std::enable_shared_from
 
   [[nodiscard]] const std::string& label() const override { return _label; }
   void async(Work work) override;
+  /// At once only on a thread of the pool.
+  void dispatch(Work work) override;
   void asyncAfter(std::chrono::milliseconds delay, Work work) override;
   [[nodiscard]] std::unique_ptr<Source> makeTimer(std::chrono::milliseconds first,
                                                   std::chrono::milliseconds period, Work handler,
@@ -52,8 +54,6 @@ class AsioSerialQueue final : public SerialQueue, public std::enable_shared_from
   [[nodiscard]] std::unique_ptr<Source> makeWriteSource(int descriptor, Work handler,
                                                         Work cancelHandler) override;
 
-  /// As async(), but at once when the queue is idle and this is a thread of the pool.
-  void dispatch(Work work);
   /// Runs a piece of work, which may throw if there is a log to tell of it.
   void run(const Work& work) const noexcept;
   /// Takes a step without which nobody would hear of an event any more: no memory for it ends the process.

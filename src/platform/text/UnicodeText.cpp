@@ -9,7 +9,8 @@
 
 #include <algorithm>
 #include <cstdint>
-#include <cstring>
+
+#include "platform/UTF8.h"
 
 namespace tallyd::platform {
 namespace {
@@ -32,18 +33,7 @@ std::string utf8(const icu::UnicodeString& text) {
 }  // namespace
 
 // Nearly all text is, and every rule of Unicode's then comes down to one on single bytes.
-bool isASCII(std::string_view text) {
-  constexpr std::uint64_t kHighBits = 0x8080808080808080;
-  std::uint64_t seen = 0;
-  while (text.size() >= sizeof seen) {
-    std::uint64_t word = 0;
-    std::memcpy(&word, text.data(), sizeof word);
-    seen |= word;
-    text.remove_prefix(sizeof word);
-  }
-  for (const char c : text) seen |= static_cast<unsigned char>(c);
-  return (seen & kHighBits) == 0;
-}
+bool isASCII(std::string_view text) { return asciiLength(text) == text.size(); }
 
 std::string lowercased(std::string_view text) {
   if (!isASCII(text)) return utf8(unicode(text).toLower(icu::Locale::getRoot()));

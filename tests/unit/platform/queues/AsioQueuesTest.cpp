@@ -67,6 +67,61 @@ TEST(AsioQueuesTest, QueuesWorkThatIsGivenFromTheQueueItself) {
   EXPECT_EQ(order, (std::vector<int>{1, 2}));
 }
 
+TEST(AsioQueuesTest, DispatchesAtOnceToAnIdleQueue) {
+  AsioQueues queues(2);
+  const auto caller = queues.makeSerialQueue("caller");
+  const auto idle = queues.makeSerialQueue("idle");
+  std::vector<int> order;
+  Gate done;
+  caller->async([&] {
+    order.push_back(1);
+    idle->dispatch([&] { order.push_back(2); });
+    order.push_back(3);
+    done.pass();
+  });
+  ASSERT_TRUE(done.waitFor(1));
+  EXPECT_EQ(order, (std::vector{1, 2, 3}));
+}
+
+TEST(AsioQueuesTest, DispatchesBehindWhatIsQueued) {
+  AsioQueues queues(2);
+  const auto caller = queues.makeSerialQueue("caller");
+  const auto busy = queues.makeSerialQueue("busy");
+  std::vector<int> order;
+  Gate started;
+  Gate dispatched;
+  Gate done;
+  busy->async([&] {
+    started.pass();
+    EXPECT_TRUE(dispatched.waitFor(1));
+    order.push_back(1);
+  });
+  busy->async([&] { order.push_back(2); });
+  ASSERT_TRUE(started.waitFor(1));
+  caller->async([&] {
+    busy->dispatch([&] {
+      order.push_back(3);
+      done.pass();
+    });
+    dispatched.pass();
+  });
+  ASSERT_TRUE(done.waitFor(1));
+  EXPECT_EQ(order, (std::vector{1, 2, 3}));
+}
+
+TEST(AsioQueuesTest, DispatchesFromOutsideThePoolAsItQueues) {
+  AsioQueues queues(1);
+  const auto queue = queues.makeSerialQueue("test");
+  std::thread::id thread;
+  Gate done;
+  queue->dispatch([&] {
+    thread = std::this_thread::get_id();
+    done.pass();
+  });
+  ASSERT_TRUE(done.waitFor(1));
+  EXPECT_NE(thread, std::this_thread::get_id());
+}
+
 TEST(AsioQueuesTest, KeepsTheLabelOfAQueue) {
   AsioQueues queues(1);
   EXPECT_EQ(queues.makeSerialQueue("com.quillon.test")->label(), "com.quillon.test");
