@@ -6,6 +6,8 @@
 #include <rapidjson/reader.h>
 #include <rapidjson/writer.h>
 
+#include <algorithm>
+#include <array>
 #include <charconv>
 #include <cmath>
 #include <cstring>
@@ -21,10 +23,12 @@ namespace {
 // Writing
 
 /// Where the library, which formats the real numbers, writes.
-struct TextEnd {
+struct NumberText {
   using Ch = char;
-  std::string& text;
-  void Put(char byte) { text += byte; }
+  static constexpr std::size_t kLongest = 32;  ///< Beyond the shortest text of every double.
+  std::array<char, kLongest> bytes;
+  std::size_t length = 0;
+  void Put(char byte) { bytes[length++] = byte; }
   void Flush() {}
 };
 
@@ -43,14 +47,30 @@ bool standsForItself(unsigned char byte) {
   return byte >= 0x20 && byte < 0x80 && byte != '"' && byte != '\\';
 }
 
+/// Up to seven bytes as one word; what is missing is filled up with letters.
+std::uint64_t shortWord(std::string_view text) {
+  constexpr std::uint64_t kLetters = 0x6161616161616161;
+  if (text.size() >= 4) {
+    std::uint32_t front = 0;
+    std::uint32_t back = 0;
+    std::memcpy(&front, text.data(), sizeof front);
+    std::memcpy(&back, text.data() + text.size() - sizeof back, sizeof back);
+    return std::uint64_t{front} << 32 | back;
+  }
+  std::uint64_t word = kLetters;
+  for (const char c : text) word = word << 8 | static_cast<unsigned char>(c);
+  return word;
+}
+
 /// Length of the longest start of `text` that needs no look at single characters.
 std::size_t plainLength(std::string_view text) {
+  constexpr std::size_t kWord = sizeof(std::uint64_t);
+  if (text.size() < kWord && standForThemselves(shortWord(text))) return text.size();
   const auto wordAt = [text](std::size_t place) {
     std::uint64_t word = 0;
     std::memcpy(&word, text.data() + place, sizeof word);
     return word;
   };
-  constexpr std::size_t kWord = sizeof(std::uint64_t);
   std::size_t length = 0;
   while (length + kWord <= text.size() && standForThemselves(wordAt(length))) length += kWord;
   // The last ones with some that have been looked at already.
@@ -60,34 +80,25 @@ std::size_t plainLength(std::string_view text) {
   return length;
 }
 
-void appendEscape(std::string& text, unsigned char byte) {
+/// How a control character, a quote or a backslash is written.
+std::string escapeOf(unsigned char byte) {
   switch (byte) {
     case '"':
-      text += "\\\"";
-      return;
+      return "\\\"";
     case '\\':
-      text += "\\\\";
-      return;
+      return "\\\\";
     case '\b':
-      text += "\\b";
-      return;
+      return "\\b";
     case '\f':
-      text += "\\f";
-      return;
+      return "\\f";
     case '\n':
-      text += "\\n";
-      return;
+      return "\\n";
     case '\r':
-      text += "\\r";
-      return;
+      return "\\r";
     case '\t':
-      text += "\\t";
-      return;
+      return "\\t";
     default:
-      constexpr std::string_view kDigits = "0123456789ABCDEF";
-      text += "\\u00";
-      text += kDigits[byte >> 4];
-      text += kDigits[byte & 15];
+      return fmt::format("\\u{:04X}", byte);
   }
 }
 
@@ -106,9 +117,9 @@ class JSONText::Writer {
   bool operator()(std::uint64_t value) { return literal(fmt::format_int(value)); }
   bool operator()(double value) {
     if (!std::isfinite(value)) return false;
-    _json.separate();
-    TextEnd end{_json._text};
-    return rapidjson::Writer<TextEnd>(end).Double(value);
+    NumberText text;
+    rapidjson::Writer<NumberText>(text).Double(value);
+    return literal({text.bytes.data(), text.length});
   }
   bool operator()(Date) { return false; }
   bool operator()(const Data&) { return false; }
@@ -152,7 +163,7 @@ class JSONText::Writer {
 void JSONText::key(std::string_view name) {
   separate();
   quote(name);
-  _text += ':';
+  append(':');
   _needsComma = false;
 }
 
@@ -165,52 +176,71 @@ bool JSONText::value(const Value& value) { return Writer(*this).write(value); }
 
 void JSONText::written(std::string_view json) {
   separate();
-  _text += json;
+  append(json);
 }
 
 void JSONText::start(char bracket) {
   separate();
-  _text += bracket;
+  append(bracket);
   _needsComma = false;
 }
 
 void JSONText::end(char bracket) {
-  _text += bracket;
+  append(bracket);
   _needsComma = true;
 }
 
 /// Before a value, or a key.
 void JSONText::separate() {
-  if (std::exchange(_needsComma, true)) _text += ',';
+  if (std::exchange(_needsComma, true)) append(',');
 }
 
 void JSONText::quote(std::string_view text) {
   const std::size_t plain = plainLength(text);
-  const std::size_t start = _text.size();
-  _text.append(plain + 2, '"');  // Most texts are plain: one look for room.
-  if (plain > 0) std::memcpy(&_text[start + 1], text.data(), plain);
-  if (plain == text.size()) return;
-  _text.pop_back();
-  text.remove_prefix(plain);
-  while (!text.empty()) {
-    text.remove_prefix(appendSpecial(text));
-    const std::size_t next = plainLength(text);
-    _text += text.substr(0, next);
-    text.remove_prefix(next);
+  char* place = roomFor(plain + 2);
+  *place++ = '"';
+  if (plain > 0) std::memcpy(place, text.data(), plain);
+  _length += plain + 1;
+  if (plain < text.size()) {
+    text.remove_prefix(plain);
+    while (!text.empty()) {
+      text.remove_prefix(appendSpecial(text));
+      const std::size_t next = plainLength(text);
+      append(text.substr(0, next));
+      text.remove_prefix(next);
+    }
   }
-  _text += '"';
+  append('"');
 }
 
 /// Appends the first character of `text`, which doesn't stand for itself; returns how many bytes it has.
 std::size_t JSONText::appendSpecial(std::string_view text) {
   const auto byte = static_cast<unsigned char>(text[0]);
   if (byte < 0x80) {
-    appendEscape(_text, byte);
+    append(escapeOf(byte));
     return 1;
   }
   const UTF8Sequence sequence = firstUTF8Sequence(text);
-  _text += sequence.wellFormed ? text.substr(0, sequence.length) : kReplacementCharacter;
+  append(sequence.wellFormed ? text.substr(0, sequence.length) : kReplacementCharacter);
   return sequence.length;
+}
+
+void JSONText::append(std::string_view text) {
+  if (!text.empty()) std::memcpy(roomFor(text.size()), text.data(), text.size());
+  _length += text.size();
+}
+
+void JSONText::append(char byte) {
+  *roomFor(1) = byte;
+  ++_length;
+}
+
+void JSONText::grow(std::size_t atLeast) {
+  constexpr std::size_t kLeast = 256;
+  _size = std::max({kLeast, 2 * _size, atLeast});
+  auto room = std::make_unique_for_overwrite<char[]>(_size);
+  if (_length > 0) std::memcpy(room.get(), _room.get(), _length);
+  _room = std::move(room);
 }
 
 namespace {
@@ -315,7 +345,7 @@ std::string errorText(rapidjson::ParseErrorCode code, std::size_t offset) {
 std::optional<std::string> jsonFromValue(const Value& value) {
   JSONText text;
   if (!text.value(value)) return std::nullopt;
-  return text.take();
+  return text.string();
 }
 
 JSONResult valueFromJSON(std::string_view text) {

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <cstddef>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -17,7 +18,7 @@ class JSONText {
  public:
   JSONText() = default;
   /// @param bytes  how long the text is expected to become.
-  explicit JSONText(std::size_t bytes) { _text.reserve(bytes); }
+  explicit JSONText(std::size_t bytes) { grow(bytes); }
 
   void startObject() { start('{'); }
   void endObject() { end('}'); }
@@ -31,8 +32,8 @@ class JSONText {
   /// A value, or a member with its key, that is JSON already.
   void written(std::string_view json);
 
-  [[nodiscard]] std::string_view view() const { return _text; }
-  [[nodiscard]] std::string take() { return std::move(_text); }
+  [[nodiscard]] std::string_view view() const { return {_room.get(), _length}; }
+  [[nodiscard]] std::string string() const { return std::string(view()); }
 
  private:
   class Writer;
@@ -42,8 +43,18 @@ class JSONText {
   void separate();
   void quote(std::string_view text);
   [[nodiscard]] std::size_t appendSpecial(std::string_view text);
+  void append(std::string_view text);
+  void append(char byte);
+  /// Where `bytes` more may be written; they count once `_length` does.
+  [[nodiscard]] char* roomFor(std::size_t bytes) {
+    if (_size - _length < bytes) grow(_length + bytes);
+    return _room.get() + _length;
+  }
+  void grow(std::size_t atLeast);
 
-  std::string _text;
+  std::unique_ptr<char[]> _room;  ///< The text, and behind it what is still free.
+  std::size_t _size = 0;          ///< Of both.
+  std::size_t _length = 0;
   bool _needsComma = false;
 };
 

@@ -52,7 +52,9 @@ class EventFields {
   void change(Change&& change) {
     auto kept = _fields.begin();
     for (EventField& field : _fields) {
-      if (change(field)) *kept++ = field;
+      if (!change(field)) continue;
+      if (&*kept != &field) *kept = field;
+      ++kept;
     }
     _fields.erase(kept, _fields.end());
   }

@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <cmath>
 #include <tuple>
 #include <vector>
 
@@ -38,11 +39,26 @@ auto commonFacts(const EventFacts& facts) {
 
 std::string decimal(std::int64_t number) { return fmt::format_int(number).str(); }
 
+/// As "%.3f" has it.
+std::string withMilliseconds(double seconds) {
+  // From here on a fraction has at most 42 bits, so that a thousand times it is exact; up to there a minute's
+  // number is whole.
+  constexpr double kLeast = 1024;
+  constexpr double kMost = 1e12;
+  if (!(seconds >= kLeast && seconds < kMost)) return fmt::format("{:.3f}", seconds);
+  const double whole = std::floor(seconds);
+  auto milliseconds = static_cast<std::int64_t>(std::nearbyint((seconds - whole) * 1000));
+  milliseconds += static_cast<std::int64_t>(whole) * 1000;
+  std::string text = decimal(milliseconds);
+  text.insert(text.size() - 3, 1, '.');
+  return text;
+}
+
 std::string jsonMember(std::string_view key, std::string_view text) {
   platform::JSONText json;
   json.key(key);
   json.text(text);
-  return json.take();
+  return json.string();
 }
 
 }  // namespace
@@ -55,7 +71,7 @@ std::int64_t truncateToMinute(std::int64_t seconds) {
 void EventRecord::fieldsInto(EventFields& fields) const {
   using Source = Common::Source;
   fields.clear();
-  const std::string_view clientTime = fields.keep(fmt::format("{:.3f}", _clientTime));
+  const std::string_view clientTime = fields.keep(withMilliseconds(_clientTime));
   const auto ownField = [&](const Common::Field& field) -> EventField {
     switch (field.source) {
       case Source::SessionID:

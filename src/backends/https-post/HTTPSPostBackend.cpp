@@ -1,5 +1,7 @@
 #include "backends/https-post/HTTPSPostBackend.h"
 
+#include <fmt/format.h>
+
 #include <new>
 
 #include "backends/RequestBooking.h"
@@ -221,7 +223,10 @@ TallyBackend::Payload HTTPSPostBackend::stopMessagePayload(const Payload& payloa
 EventRecord HTTPSPostBackend::createEventDictfromPayload(const Payload& payload, const timeval& timestamp,
                                                          std::uint16_t method, std::uint16_t respCode,
                                                          std::uint16_t eventID) {
-  const std::string sessionID = _combinedSessionIDString.value_or(std::to_string(_sessionID));
+  const fmt::format_int plainSessionID(_sessionID);
+  const std::string_view sessionID = _combinedSessionIDString
+                                         ? std::string_view(*_combinedSessionIDString)
+                                         : std::string_view(plainSessionID.data(), plainSessionID.size());
   return _records.record(payload, {.sessionStart = _startTimeStamp,
                                    .sender = codeForClientType(_compType),
                                    .clientVersion = _clientVersion,
@@ -280,14 +285,14 @@ std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::takeBatchForPost() {
 
 std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::documentOf(const Events& events) const {
   try {
-    return createMessageForPost(prepareEventArrayForMessage(events), events.size());
+    return createMessageForPost(prepareEventArrayForMessage(events).view(), events.size());
   } catch (const std::bad_alloc&) {
     dropForMemory(events.size());
     return std::nullopt;
   }
 }
 
-std::string HTTPSPostBackend::prepareEventArrayForMessage(const Events& events) const {
+platform::JSONText HTTPSPostBackend::prepareEventArrayForMessage(const Events& events) const {
   constexpr std::size_t kUsualEventBytes = 1024;
   platform::JSONText array(events.size() * kUsualEventBytes);
   EventFields fields;
@@ -300,7 +305,7 @@ std::string HTTPSPostBackend::prepareEventArrayForMessage(const Events& events) 
     appendEvent(array, fields);
   }
   array.endArray();
-  return array.take();
+  return array;
 }
 
 void HTTPSPostBackend::dropForMemory(std::size_t events) const {

@@ -12,6 +12,7 @@
 #include "backends/https-post/EventRecord.h"
 #include "backends/https-post/ReportingRules.h"
 #include "platform/HTTPClient.h"
+#include "platform/JSON.h"
 #include "support/Consent.h"
 
 namespace tallyd::platform {
@@ -92,7 +93,7 @@ class HTTPSPostBackend final : public TallyBackend {
   /// Takes events that are booked as being in flight.
   std::optional<Document> documentOf(const Events& events) const;
   /// The events as a JSON array: each with the user info, filtered, and what is not fit for JSON left out.
-  [[nodiscard]] std::string prepareEventArrayForMessage(const Events& events) const;
+  [[nodiscard]] platform::JSONText prepareEventArrayForMessage(const Events& events) const;
   [[nodiscard]] Document createMessageForPost(std::string_view eventArray, std::size_t count) const;
   void dropForMemory(std::size_t events) const;  ///< Of those in flight.
   Result postJsonMessage(const Document& document) const;

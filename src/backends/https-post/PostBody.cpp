@@ -60,7 +60,7 @@ std::string postBody(const timeval& postTime, const std::optional<std::string>& 
   body.key("postTime");
   body.text(fmt::format("{}.{:3}", postTime.tv_sec, postTime.tv_usec / 1000));
   body.endObject();
-  return body.take();
+  return body.string();
 }
 
 }  // namespace tallyd

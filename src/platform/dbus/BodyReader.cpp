@@ -161,7 +161,9 @@ class Reader {
 
 ReadValues readBody(std::string_view body, std::endian order, std::string_view signature,
                     std::vector<FileDescriptor> descriptors) {
+  constexpr std::size_t kUsualArguments = 4;
   ReadValues result;
+  result.values.reserve(kUsualArguments);
   try {
     Reader reader(body, order, std::move(descriptors), result.descriptors);
     while (!signature.empty()) {

@@ -1,6 +1,10 @@
 #include "backends/https-post/EventRecord.h"
 
+#include <fmt/format.h>
 #include <gtest/gtest.h>
+
+#include <cmath>
+#include <random>
 
 #include "backends/https-post/PostBody.h"
 
@@ -110,6 +114,18 @@ TEST(EventRecordTest, RoundsTheEventTimeToMilliseconds) {
   EXPECT_EQ(timesOf(0, 0.0004).event, "0.000");
   EXPECT_EQ(timesOf(0, 0.0006).event, "0.001");
   EXPECT_EQ(timesOf(0, 0.9996).event, "1.000");
+}
+
+TEST(EventRecordTest, RoundsHalvesToEvenAndCarriesLikeEveryFormatter) {
+  EXPECT_EQ(timesOf(0, 60'000.0625).event, "60000.062");
+  EXPECT_EQ(timesOf(0, 60'000.1875).event, "60000.188");
+  EXPECT_EQ(timesOf(0, 1'768'478'400.99975).event, "1768478401.000");
+  std::mt19937_64 random(7);
+  std::uniform_real_distribution<double> exponent(0, 13);
+  for (int i = 0; i < 20'000; ++i) {
+    const double time = std::pow(10, exponent(random));
+    EXPECT_EQ(timesOf(0, time).event, fmt::format("{:.3f}", time));
+  }
 }
 
 TEST(EventRecordTest, TruncatesToTheMinuteTowardZero) {
