@@ -111,7 +111,7 @@ void MessageLog::writeLine(std::string_view message) {
   // A date alone names no file; a path alone is written to as it is until a later search finds its date.
   if (!file.path) file = createFile();
   if (file.path) append(file, message);
-  remember(file);
+  if (!file.isSaved) remember(file);
 }
 
 void MessageLog::ensureLogDirectory() {
@@ -125,11 +125,12 @@ void MessageLog::ensureLogDirectory() {
 }
 
 MessageLog::CurrentFile MessageLog::savedFile() const {
+  const auto path = _platform.defaults.value(kPathKey);
+  const auto created = _platform.defaults.value(kCreationDateKey);
   CurrentFile file;
-  if (const auto path = _platform.defaults.value(kPathKey); path && path->string()) {
-    file.path = std::string(*path->string());
-  }
-  if (const auto created = _platform.defaults.value(kCreationDateKey)) file.created = created->date();
+  if (path && path->string()) file.path = std::string(*path->string());
+  if (created) file.created = created->date();
+  file.isSaved = path.has_value() == file.path.has_value() && created.has_value() == file.created.has_value();
   if (!file.path) return file;
   struct stat facts {};
   if (::stat(file.path->c_str(), &facts) == 0) {

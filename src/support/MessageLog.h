@@ -56,6 +56,7 @@ class MessageLog {
     std::optional<std::string> path;
     std::optional<platform::Date> created;
     std::optional<Identity> identity{};  ///< Where it was looked for at its path, and found.
+    bool isSaved = false;                ///< The defaults hold just this.
   };
 
   void writeFormatted(fmt::string_view format, fmt::format_args arguments);

@@ -65,13 +65,14 @@ std::string descriptionForObject(const Value& object) {
 std::string sanitize(std::string_view text) {
   std::string sanitized;
   sanitized.reserve(text.size());
-  while (!text.empty()) {
-    const std::size_t plain = std::min(text.find_first_of("\n\\="), text.size());
-    sanitized += text.substr(0, plain);
-    text.remove_prefix(plain);
-    if (text.empty()) break;
-    if (text[0] != '\n') sanitized.append({'\\', text[0]});
-    text.remove_prefix(1);
+  const auto isSpecial = [](char c) { return c == '\n' || c == '\\' || c == '='; };
+  for (auto next = text.begin(); next != text.end();) {
+    const auto special = std::find_if(next, text.end(), isSpecial);
+    sanitized.append(next, special);
+    if (special == text.end()) break;
+    if (*special == '\\' || *special == '=') sanitized += '\\';
+    if (*special != '\n') sanitized += *special;
+    next = special + 1;
   }
   return sanitized.empty() ? "empty" : sanitized;
 }

@@ -54,6 +54,7 @@ TransferLoop::TransferLoop()
 
 void TransferLoop::turn(milliseconds longest) {
   if (_hasLostSockets) return turnWithoutSockets(longest);
+  if (actIfDue()) return;
   constexpr int kEventsAtATime = 32;
   std::array<epoll_event, kEventsAtATime> events{};
   const int count = ::epoll_wait(_epoll.get(), events.data(), kEventsAtATime, waitTime(longest));
@@ -66,9 +67,15 @@ void TransferLoop::turn(milliseconds longest) {
       act(event.data.fd, curlEvents(event.events));
     }
   }
-  if (!_due || *_due > steady_clock::now()) return;
+  actIfDue();
+}
+
+/// Whether a time of libcurl's had come.
+bool TransferLoop::actIfDue() {
+  if (!_due || *_due > steady_clock::now()) return false;
   _due.reset();
   act(CURL_SOCKET_TIMEOUT, 0);
+  return true;
 }
 
 void TransferLoop::wake() const { ::eventfd_write(_wakeUp.get(), 1); }

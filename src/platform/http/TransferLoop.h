@@ -36,6 +36,7 @@ class TransferLoop {
   static int onTimer(CURLM* multi, long milliseconds, void* self);
 
   [[nodiscard]] int waitTime(std::chrono::milliseconds longest) const;
+  bool actIfDue();
   void act(curl_socket_t socket, int events);
   void turnWithoutSockets(std::chrono::milliseconds longest);
 
