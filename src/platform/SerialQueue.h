@@ -5,6 +5,7 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <utility>
 
 namespace tallyd::platform {
 
@@ -38,7 +39,7 @@ class SerialQueue {
   virtual void async(Work work) = 0;
   /// As async(), or at once on this thread when the queue has nothing to do: for short work whose order on
   /// the queue matters, and not its thread. The caller must hold no lock that the work takes.
-  virtual void dispatch(Work work) = 0;
+  virtual void dispatch(Work work) { async(std::move(work)); }
   virtual void asyncAfter(std::chrono::milliseconds delay, Work work) = 0;
 
   /// Calls `handler` after `first` and then every `period`; ticks that come late are not made up for.

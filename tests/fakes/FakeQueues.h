@@ -212,7 +212,6 @@ class FakeQueues : public platform::Queues {
     ~Queue() override { --_state->queues; }
     const std::string& label() const override { return _label; }
     void async(Work work) override { _state->give(std::move(work)); }
-    void dispatch(Work work) override { async(std::move(work)); }
     void asyncAfter(Milliseconds delay, Work work) override { _state->arm(delay, std::move(work)); }
     std::unique_ptr<platform::Source> makeTimer(Milliseconds first, Milliseconds period, Work handler,
                                                 Work cancelHandler) override {

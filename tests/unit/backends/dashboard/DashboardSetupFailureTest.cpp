@@ -39,7 +39,6 @@ class RefusingQueues : public platform::Queues {
         : _owner(owner), _queue(std::move(queue)) {}
     const std::string& label() const override { return _queue->label(); }
     void async(Work work) override { _queue->async(std::move(work)); }
-    void dispatch(Work work) override { _queue->dispatch(std::move(work)); }
     void asyncAfter(std::chrono::milliseconds delay, Work work) override {
       _queue->asyncAfter(delay, std::move(work));
     }

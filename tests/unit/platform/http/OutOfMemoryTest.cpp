@@ -61,7 +61,6 @@ class ScriptedQueue final : public SerialQueue {
     _work.push_back(std::move(work));
     _given.notify_all();
   }
-  void dispatch(Work work) override { async(std::move(work)); }
   void asyncAfter(std::chrono::milliseconds, Work) override { ADD_FAILURE(); }
   std::unique_ptr<Source> makeTimer(std::chrono::milliseconds, std::chrono::milliseconds, Work,
                                     Work) override {
