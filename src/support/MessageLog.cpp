@@ -58,6 +58,10 @@ std::string describe(const std::optional<Date>& date) { return date ? Value(*dat
 
 std::string errorText(int error) { return std::generic_category().message(error); }
 
+FileDescriptor openForLine(const std::string& path) {
+  return FileDescriptor(::open(path.c_str(), O_WRONLY | O_APPEND | O_CLOEXEC));
+}
+
 /// Writes all of `text`; the error's number when it can't.
 int writeAll(int descriptor, std::string_view text) {
   while (!text.empty()) {
@@ -132,11 +136,8 @@ MessageLog::CurrentFile MessageLog::savedFile() const {
   if (created) file.created = created->date();
   file.isSaved = path.has_value() == file.path.has_value() && created.has_value() == file.created.has_value();
   if (!file.path) return file;
-  struct stat facts {};
-  if (::stat(file.path->c_str(), &facts) == 0) {
-    file.identity = {facts.st_dev, facts.st_ino};
-    return file;
-  }
+  file.opened = openForLine(*file.path);
+  if (file.opened || exists(*file.path)) return file;
   asl_log(_platform.log, LogLevel::Info, "Saved tallyd log file {} not found - invalidating file path",
           *file.path);
   return {};
@@ -147,7 +148,7 @@ MessageLog::CurrentFile MessageLog::findExistingFile(CurrentFile file) {
   const auto name = firstListedFile();
   if (!name) return file;
   const std::string path = _directory + "/" + *name;
-  file = {path, creationDate(path)};
+  file = {path, creationDate(path), {}, false};
   asl_log(_platform.log, LogLevel::Info, "Found existing tallyd log file {} ({})", *file.path,
           describe(file.created));
   return file;
@@ -180,7 +181,6 @@ void MessageLog::retire(const CurrentFile& file) {
           describe(file.created));
   std::error_code ignored;
   if (file.path) std::filesystem::remove(*file.path, ignored);
-  _file.reset();
 }
 
 MessageLog::CurrentFile MessageLog::createFile() {
@@ -202,24 +202,13 @@ void MessageLog::append(const CurrentFile& file, std::string_view message) {
   std::string line;
   line.reserve(date.size() + message.size() + std::string_view("() \n").size());
   line.append("(").append(date).append(") ").append(message).append("\n");
-  if (const int error = write(file, line)) {
+  const FileDescriptor opened = file.opened ? FileDescriptor() : openForLine(*file.path);
+  const FileDescriptor& descriptor = file.opened ? file.opened : opened;
+  if (const int error = descriptor ? writeAll(descriptor.get(), line) : errno) {
     asl_log(_platform.log, LogLevel::Critical, "Error writing to tallyd log file {}: {}", *file.path,
             errorText(error));
   }
   asl_log(_platform.log, LogLevel::Info, "Saved log message to {}", *file.path);
-}
-
-/// 0, or the error's number. The file stays open as long as its path leads to it.
-int MessageLog::write(const CurrentFile& file, std::string_view line) {
-  if (!_file || !file.identity || file.identity != _identity) {
-    _file = FileDescriptor(::open(file.path->c_str(), O_WRONLY | O_APPEND | O_CLOEXEC));
-    struct stat facts {};
-    if (!_file || ::fstat(_file.get(), &facts) != 0) return errno;
-    _identity = {facts.st_dev, facts.st_ino};
-  }
-  const int error = writeAll(_file.get(), line);
-  if (error != 0) _file.reset();
-  return error;
 }
 
 /// Of now; made once a second.

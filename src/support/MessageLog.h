@@ -2,7 +2,6 @@
 #pragma once
 
 #include <fmt/format.h>
-#include <sys/types.h>
 
 #include <chrono>
 #include <filesystem>
@@ -45,18 +44,12 @@ class MessageLog {
   }
 
  private:
-  /// Which file a path leads to.
-  struct Identity {
-    dev_t device;
-    ino_t number;
-    bool operator==(const Identity&) const = default;
-  };
   /// The file that lines go to; path and date may each be missing.
   struct CurrentFile {
     std::optional<std::string> path;
     std::optional<platform::Date> created;
-    std::optional<Identity> identity{};  ///< Where it was looked for at its path, and found.
-    bool isSaved = false;                ///< The defaults hold just this.
+    platform::FileDescriptor opened{};  ///< Where it has been looked for by opening it.
+    bool isSaved = false;               ///< The defaults hold just this.
   };
 
   void writeFormatted(fmt::string_view format, fmt::format_args arguments);
@@ -70,15 +63,12 @@ class MessageLog {
   void retire(const CurrentFile& file);
   CurrentFile createFile();
   void append(const CurrentFile& file, std::string_view message);
-  [[nodiscard]] int write(const CurrentFile& file, std::string_view line);
   [[nodiscard]] const std::string& dateText();
   void remember(const CurrentFile& file);
 
   const platform::Platform& _platform;
   const std::string _directory;
   std::mutex _mutex;
-  platform::FileDescriptor _file;  ///< Open from one line to the next, as long as the path leads to it.
-  std::optional<Identity> _identity;
   double _dateSecond = 0;  ///< Of `_dateText`, since 1970.
   std::string _dateText;
 };

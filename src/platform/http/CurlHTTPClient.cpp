@@ -48,7 +48,7 @@ class CurlHTTPClient::Implementation {
     CURLcode code = curl_easy_perform(transfer.handle());
     if (transfer.prepareSecondAttempt(code)) code = curl_easy_perform(transfer.handle());
     HTTPResult result = transfer.result(code);
-    _handles.giveBack(transfer.releaseHandle());
+    if (transfer.mayReuseHandle()) _handles.giveBack(transfer.releaseHandle());
     return result;
   }
 

@@ -325,7 +325,7 @@ std::size_t CurlTransfer::onHeader(char* bytes, std::size_t size, std::size_t co
 }
 
 int CurlTransfer::onStart(void* self, char*, char*, int, int) {
-  static_cast<CurlTransfer*>(self)->_started = true;
+  ++static_cast<CurlTransfer*>(self)->_starts;
   return CURL_PREREQFUNC_OK;
 }
 

@@ -58,7 +58,10 @@ class CurlTransfer {
   [[nodiscard]] CURL* handle() const { return _handle.get(); }
   [[nodiscard]] const HTTPRequest& request() const { return _request; }
   /// Whether a connection was found and the request is on its way.
-  [[nodiscard]] bool hasStarted() const { return _started; }
+  [[nodiscard]] bool hasStarted() const { return _starts > 0; }
+  /// Whether the handle may be used again: libcurl counts how often requests of a handle had to be run again,
+  /// for as long as there is the handle, and after five times lets the next one fail.
+  [[nodiscard]] bool mayReuseHandle() const { return _starts <= 1; }
 
   /// After the handle has been run: whether the request is to be run once more, on a connection of its own,
   /// because the one that it had waited idle and was closed by the server as the request came. Such a request
@@ -94,7 +97,7 @@ class CurlTransfer {
   std::size_t _receivedBytes = 0;
   bool _tooLarge = false;
   bool _outOfMemory = false;
-  bool _started = false;
+  int _starts = 0;  ///< How often it was on its way; more than once also after a redirect.
   bool _secondAttempt = false;
 };
 

@@ -214,7 +214,7 @@ void TransferEngine::settle(Jobs& from, Jobs::iterator job, const MakeResult& ma
   }
   if (job->transfer) {
     curl_multi_remove_handle(_loop.multi(), job->transfer->handle());
-    _pool.giveBack(job->transfer->releaseHandle());
+    if (job->transfer->mayReuseHandle()) _pool.giveBack(job->transfer->releaseHandle());
     job->transfer.reset();
   }
   job->request = {};
