@@ -244,6 +244,7 @@ LoadResult LoadBench::run(const Days& days) {
         runSession(hours * sessionsAnHour + i, i >= days.postingSessions);
       }
     });
+    settle(result);
     if (hours >= days.firstHours) result.samples.push_back(figures());
   }
   result.sessions += hours * sessionsAnHour;
@@ -254,12 +255,17 @@ LoadResult LoadBench::run(const Days& days) {
   return result;
 }
 
-void LoadBench::finish(LoadResult& result) {
-  result.balanced = true;
+void LoadBench::settle(LoadResult& result) {
   TallyInspection inspection(inspectionSocketPath(_root.root()));
   const auto deadline = steady_clock::now() + WatchedProcess::kPatience;
   while (!lookAtBooks(inspection, result) && steady_clock::now() < deadline) {
   }
+}
+
+void LoadBench::finish(LoadResult& result) {
+  settle(result);
+  TallyInspection inspection(inspectionSocketPath(_root.root()));
+  const auto deadline = steady_clock::now() + WatchedProcess::kPatience;
   // Threads that blocking calls have called for go after a while.
   do {
     result.after = figures();

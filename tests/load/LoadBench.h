@@ -43,7 +43,7 @@ struct Crowd {
 /// `eventsOfAPostingSession` events that are posted one by one, and leave; `batchingSessions` clients send
 /// `eventsOfABatchingSession` events of three methods and flush after every 30th. The user consents, so that
 /// every post is written to the message log too. Clients of an hour come over four lanes, one after the other
-/// in each, as fast as they are served.
+/// in each, as fast as they are served. An hour begins when all of the last one's events have been posted.
 struct Days {
   std::size_t postingSessions = 40;
   std::size_t eventsOfAPostingSession = 50;
@@ -67,7 +67,7 @@ struct LoadResult {
   std::uint64_t accepted = 0;           ///< By the books.
   std::uint64_t sent = 0;
   std::uint64_t arrived = 0;  ///< At the collector.
-  bool balanced = false;      ///< In every look at the books.
+  bool balanced = true;       ///< In every look at the books.
 
   /// Means over the second and the last tenth of the samples.
   [[nodiscard]] double secondTenthBytes() const { return tenthBytes(1); }
@@ -92,6 +92,8 @@ class LoadBench {
  private:
   [[nodiscard]] ProcessFigures figures() { return figuresOf(_daemon.process().pid()); }
   void runFirstSession();
+  /// Waits until nothing is under way and nobody is connected.
+  void settle(LoadResult& result);
   void finish(LoadResult& result);
 
   StorebagServer _storebags;
