@@ -1,6 +1,6 @@
 #include "backends/dashboard/LocalLog.h"
 
-#include <fmt/compile.h>
+#include <fmt/format.h>
 
 #include <iterator>
 
@@ -16,8 +16,7 @@ std::string writeLocalLog(std::string_view datagram) {
     return text.substr(0, text.find('\0'));
   };
   std::string line;
-  fmt::format_to(std::back_inserter(line),
-                 FMT_COMPILE("{}.{:03} {} 127.0.0.1 {} {:5} {:5} {:5} {:5} {:5} {}"),
+  fmt::format_to(std::back_inserter(line), "{}.{:03} {} 127.0.0.1 {} {:5} {:5} {:5} {:5} {:5} {}",
                  datagramNumber32(datagram, DatagramSeconds),
                  datagramByte(datagram, DatagramSubsecond) * (kDatagramSubsecondMicroseconds / 1000),
                  textAt(DatagramDeviceID, kDatagramDeviceIDBytes),
