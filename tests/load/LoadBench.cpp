@@ -89,20 +89,26 @@ void expectBalance(const Dictionary& row, LoadResult& result) {
   if (row.integer("accepted") != sum) result.balanced = false;
 }
 
-/// Takes a look at the books; true once nothing is under way and nobody is connected.
-bool lookAtBooks(TallyInspection& inspection, LoadResult& result) {
+struct Look {
+  bool nobodyIsConnected = false;
+  bool nothingIsUnderWay = true;
+};
+
+/// Takes a look at the books.
+Look lookAtBooks(TallyInspection& inspection, LoadResult& result) {
   const StatsReply reply = inspection.statsSync();
   if (reply.error) throw std::runtime_error(*reply.error);
-  bool settled =
+  Look look;
+  look.nobodyIsConnected =
       reply.stats.dictionary("connections")->integer("open") == 0 && reply.stats.array("sessions")->empty();
   for (const Value& value : *reply.stats.dictionary("total")->array("backends")) {
     const Dictionary& row = *value.dictionary();
     expectBalance(row, result);
-    settled = settled && row.integer("held") == 0 && row.integer("inFlight") == 0;
+    if (row.integer("held") != 0 || row.integer("inFlight") != 0) look.nothingIsUnderWay = false;
     result.accepted = static_cast<std::uint64_t>(row.integer("accepted").value_or(0));
     result.sent = static_cast<std::uint64_t>(row.integer("sent").value_or(0));
   }
-  return settled;
+  return look;
 }
 
 double secondsSince(steady_clock::time_point start) {
@@ -204,6 +210,7 @@ LoadResult LoadBench::run(const Crowd& crowd) {
                                 Answer::Wanted);
       }
     });
+    waitForPosts(result);
     result.samples.push_back(figures());
   }
   result.messages = 1 + rounds * crowd.active;
@@ -244,7 +251,7 @@ LoadResult LoadBench::run(const Days& days) {
         runSession(hours * sessionsAnHour + i, i >= days.postingSessions);
       }
     });
-    settle(result);
+    waitForPosts(result);
     if (hours >= days.firstHours) result.samples.push_back(figures());
   }
   result.sessions += hours * sessionsAnHour;
@@ -255,22 +262,26 @@ LoadResult LoadBench::run(const Days& days) {
   return result;
 }
 
-void LoadBench::settle(LoadResult& result) {
+void LoadBench::waitForPosts(LoadResult& result) {
   TallyInspection inspection(inspectionSocketPath(_root.root()));
   const auto deadline = steady_clock::now() + WatchedProcess::kPatience;
-  while (!lookAtBooks(inspection, result) && steady_clock::now() < deadline) {
+  while (!lookAtBooks(inspection, result).nothingIsUnderWay && steady_clock::now() < deadline) {
   }
 }
 
 void LoadBench::finish(LoadResult& result) {
-  settle(result);
   TallyInspection inspection(inspectionSocketPath(_root.root()));
   const auto deadline = steady_clock::now() + WatchedProcess::kPatience;
+  const auto isSettled = [&] {
+    const Look look = lookAtBooks(inspection, result);
+    return look.nobodyIsConnected && look.nothingIsUnderWay;
+  };
+  while (!isSettled() && steady_clock::now() < deadline) {
+  }
   // Threads that blocking calls have called for go after a while.
   do {
     result.after = figures();
-  } while (result.after.threads > result.before.threads && lookAtBooks(inspection, result) &&
-           steady_clock::now() < deadline);
+  } while (result.after.threads > result.before.threads && isSettled() && steady_clock::now() < deadline);
   result.arrived = _collector.events();
 }
 

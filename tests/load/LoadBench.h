@@ -32,7 +32,8 @@ class CountingCollector {
 struct Crowd {
   std::size_t connections = 10'000;
   std::size_t active = 1'000;
-  std::size_t rounds = 20;  ///< In each, every active client sends a message and waits for the answer.
+  /// In each, every active client sends a message and waits for the answer; it ends when all are posted.
+  std::size_t rounds = 20;
   std::chrono::seconds atLeast{0};  ///< Rounds go on for this long.
 
   /// As large as the limit of descriptors of this process and of the daemon's allows.
@@ -92,8 +93,7 @@ class LoadBench {
  private:
   [[nodiscard]] ProcessFigures figures() { return figuresOf(_daemon.process().pid()); }
   void runFirstSession();
-  /// Waits until nothing is under way and nobody is connected.
-  void settle(LoadResult& result);
+  void waitForPosts(LoadResult& result);  ///< Until nothing is under way.
   void finish(LoadResult& result);
 
   StorebagServer _storebags;
