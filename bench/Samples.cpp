@@ -139,7 +139,11 @@ std::string documentOf(std::size_t events) {
     appendEvent(array, fields);
   }
   array.endArray();
-  return postBody({1'760'000'200, 125'000}, "6f1cbb53-52a8-5f0c-9d0a-0d1a4c6b7e21", array.view());
+  return documentAround(array.view());
+}
+
+std::string documentAround(std::string_view eventArray) {
+  return postBody({1'760'000'200, 125'000}, "6f1cbb53-52a8-5f0c-9d0a-0d1a4c6b7e21", eventArray);
 }
 
 Array filterRules(std::size_t count, Hashing hashing) {

@@ -48,6 +48,8 @@ class FreshFields {
 
 /// The body of a post of so many records with the user info.
 [[nodiscard]] std::string documentOf(std::size_t events);
+/// The body of a post with these events; a constant beside them.
+[[nodiscard]] std::string documentAround(std::string_view eventArray);
 
 enum class Hashing { No, Yes };
 

@@ -62,7 +62,7 @@ void Account::dropNew(DropReason reason, std::uint64_t count, const std::optiona
   {
     const std::lock_guard lock(_mutex);
     _counts.accepted += count;
-    _counts.dropped[static_cast<std::size_t>(reason)] += count;
+    _counts.droppedFor(reason) += count;
   }
   showDrop(reason, count, message);
 }
@@ -82,7 +82,7 @@ void Account::dropHeld(DropReason reason, std::uint64_t count, const std::option
   {
     const std::lock_guard lock(_mutex);
     take(_counts.held, count);
-    _counts.dropped[static_cast<std::size_t>(reason)] += count;
+    _counts.droppedFor(reason) += count;
   }
   showDrop(reason, count, message);
 }
@@ -104,7 +104,7 @@ void Account::drop(DropReason reason, std::uint64_t count, const std::optional<M
   {
     const std::lock_guard lock(_mutex);
     take(_counts.inFlight, count);
-    _counts.dropped[static_cast<std::size_t>(reason)] += count;
+    _counts.droppedFor(reason) += count;
   }
   showDrop(reason, count, message);
 }

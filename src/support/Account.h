@@ -2,6 +2,7 @@
 #pragma once
 
 #include <array>
+#include <cstddef>
 #include <cstdint>
 #include <memory>
 #include <mutex>
@@ -26,6 +27,12 @@ struct AccountCounts {
   std::uint64_t passedBy = 0;  ///< Not accepted: offered, and of a sort that this way out does not carry.
   std::array<std::uint64_t, kDropReasonCount> dropped{};
 
+  [[nodiscard]] std::uint64_t droppedFor(DropReason reason) const {
+    return dropped[static_cast<std::size_t>(reason)];
+  }
+  [[nodiscard]] std::uint64_t& droppedFor(DropReason reason) {
+    return dropped[static_cast<std::size_t>(reason)];
+  }
   [[nodiscard]] std::uint64_t droppedInAll() const;
   [[nodiscard]] bool isBalanced() const { return accepted == sent + held + inFlight + droppedInAll(); }
   AccountCounts& operator+=(const AccountCounts& other);

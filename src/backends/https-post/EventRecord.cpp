@@ -41,10 +41,9 @@ std::string decimal(std::int64_t number) { return fmt::format_int(number).str();
 
 /// As "%.3f" has it.
 std::string withMilliseconds(double seconds) {
-  // From here on a fraction has at most 42 bits, so that a thousand times it is exact; up to there a minute's
-  // number is whole.
-  constexpr double kLeast = 1024;
-  constexpr double kMost = 1e12;
+  constexpr double kLeast =
+      1024;  // From here on fractions have at most 42 bits: a thousand times one is exact.
+  constexpr double kMost = 1e12;  // Below this the milliseconds fit their type.
   if (!(seconds >= kLeast && seconds < kMost)) return fmt::format("{:.3f}", seconds);
   const double whole = std::floor(seconds);
   auto milliseconds = static_cast<std::int64_t>(std::nearbyint((seconds - whole) * 1000));

@@ -325,16 +325,14 @@ HTTPSPostBackend::Document HTTPSPostBackend::createMessageForPost(std::string_vi
 }
 
 TallyBackend::Result HTTPSPostBackend::postJsonMessage(const Document& document) const {
-  platform::HTTPRequest request;
-  platform::HTTPClient::Completion completion;
   try {
-    request = requestFor(document.json);
-    completion = completionFor(document, request);
+    platform::HTTPRequest request = requestFor(document.json);
+    auto completion = completionFor(document, request);
+    _platform.http.sendAsynchronousRequest(std::move(request), _queue, std::move(completion));
   } catch (const std::bad_alloc&) {
     dropForMemory(document.events);
     return std::nullopt;
   }
-  _platform.http.sendAsynchronousRequest(std::move(request), _queue, std::move(completion));
   return _dnuType == DNUTypeConsent && _dnuEnabled ? Result(document.json) : std::nullopt;
 }
 

@@ -56,9 +56,7 @@ class CurlShare {
 /// Threading: any thread; one handle belongs to one user at a time.
 class CurlHandlePool {
  public:
-  /// @param configure  sets what all users of the handles want; false when that fails. Each handle hears of
-  /// it
-  ///                   once.
+  /// @param configure  sets what all users of the handles want, once for each handle; false when that fails.
   CurlHandlePool(std::size_t maximumIdle, std::function<bool(CURL*)> configure);
 
   /// A configured handle, whose other options are those of its last user; null when memory runs out.

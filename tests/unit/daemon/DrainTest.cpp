@@ -76,11 +76,11 @@ TEST(BalanceLineTest, AddsTheBackendsUpAndNamesEachReason) {
   posts.sent = 6;
   posts.held = 1;
   posts.inFlight = 1;
-  posts.dropped[static_cast<std::size_t>(DropReason::PostFailed)] = 2;
+  posts.droppedFor(DropReason::PostFailed) = 2;
   AccountCounts& datagrams = totals.backends[{"dashboard", "dashboard"}];
   datagrams.accepted = 4;
   datagrams.sent = 3;
-  datagrams.dropped[static_cast<std::size_t>(DropReason::CleanUp)] = 1;
+  datagrams.droppedFor(DropReason::CleanUp) = 1;
   EXPECT_EQ(balanceLine(totals),
             "Drained: accepted 14, sent 9, dropped 3 (post-failed 2, clean-up 1), not finished 2.");
   EXPECT_EQ(unfinishedOf(totals), 2U);

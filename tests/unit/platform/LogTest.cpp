@@ -3,25 +3,9 @@
 #include <gtest/gtest.h>
 
 #include <new>
-#include <utility>
 
 #include "fakes/FakeLog.h"
-
-namespace {
-
-/// What takes more memory to write than there is.
-struct TooLarge {};
-
-}  // namespace
-
-template <>
-struct fmt::formatter<TooLarge> {
-  constexpr auto parse(format_parse_context& context) { return context.begin(); }
-  template <class Context>
-  auto format(const TooLarge&, Context&) const -> decltype(std::declval<Context>().out()) {
-    throw std::bad_alloc();
-  }
-};
+#include "fakes/TooLarge.h"
 
 namespace tallyd::platform {
 namespace {
@@ -34,7 +18,7 @@ TEST(LogTest, WritesOneFormattedLine) {
 
 TEST(LogTest, FormatsNothingThatNobodyTakes) {
   fakes::FakeLog log(LogLevel::Info);
-  asl_log(log, LogLevel::Debug, "{}", TooLarge());
+  asl_log(log, LogLevel::Debug, "{}", fakes::TooLarge());
   EXPECT_TRUE(log.lines().empty());
 }
 
@@ -45,7 +29,7 @@ TEST(LogTest, LosesALineForWhichThereIsNoMemoryAndFailsNobody) {
   } full;
   EXPECT_NO_THROW(asl_log(full, LogLevel::Critical, "a line"));
   fakes::FakeLog log;
-  EXPECT_NO_THROW(asl_log(log, LogLevel::Critical, "{}", TooLarge()));
+  EXPECT_NO_THROW(asl_log(log, LogLevel::Critical, "{}", fakes::TooLarge()));
   EXPECT_TRUE(log.lines().empty());
 }
 

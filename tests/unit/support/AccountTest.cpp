@@ -11,10 +11,6 @@ namespace {
 
 using platform::Dictionary;
 
-std::uint64_t droppedFor(const AccountCounts& counts, DropReason reason) {
-  return counts.dropped[static_cast<std::size_t>(reason)];
-}
-
 TEST(AccountTest, BeginsWithNothing) {
   const Account account;
   EXPECT_EQ(account.counts(), AccountCounts());
@@ -36,7 +32,7 @@ TEST(AccountTest, FollowsAPieceThroughItsPlaces) {
   account.dropHeld(DropReason::CleanUp, 2);
   const auto counts = account.counts();
   EXPECT_EQ(counts.held, 0U);
-  EXPECT_EQ(droppedFor(counts, DropReason::CleanUp), 2U);
+  EXPECT_EQ(counts.droppedFor(DropReason::CleanUp), 2U);
   EXPECT_EQ(counts.accepted, 3U);
   EXPECT_TRUE(counts.isBalanced());
 }
@@ -52,7 +48,7 @@ TEST(AccountTest, CountsWhatIsSentOrDroppedAtOnceAsAccepted) {
   EXPECT_EQ(counts.sent, 2U);
   EXPECT_EQ(counts.inFlight, 1U);
   EXPECT_EQ(counts.droppedInAll(), 4U);
-  EXPECT_EQ(droppedFor(counts, DropReason::PostFailed), 3U);
+  EXPECT_EQ(counts.droppedFor(DropReason::PostFailed), 3U);
   EXPECT_TRUE(counts.isBalanced());
 }
 

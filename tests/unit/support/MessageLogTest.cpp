@@ -4,27 +4,11 @@
 #include <sys/stat.h>
 
 #include <fstream>
-#include <new>
 #include <sstream>
 #include <thread>
 
 #include "fakes/FakePlatform.h"
-
-namespace {
-
-/// What takes more memory to write than there is.
-struct TooLarge {};
-
-}  // namespace
-
-template <>
-struct fmt::formatter<TooLarge> {
-  constexpr auto parse(format_parse_context& context) { return context.begin(); }
-  template <class Context>
-  auto format(const TooLarge&, Context&) const -> decltype(std::declval<Context>().out()) {
-    throw std::bad_alloc();
-  }
-};
+#include "fakes/TooLarge.h"
 
 namespace tallyd {
 namespace {
@@ -103,7 +87,7 @@ TEST_F(MessageLogTest, MakesDirectoryAndFileAtTheFirstCall) {
 
 TEST_F(MessageLogTest, LosesALineForWhichThereIsNoMemoryAndNoOther) {
   log.writeMessageLog("one");
-  log.writeMessageLog("{}", TooLarge());
+  log.writeMessageLog("{}", fakes::TooLarge());
   log.writeMessageLog("three");
   EXPECT_EQ(read(path(currentName())), "(" + now() + ") one\n(" + now() + ") three\n");
   EXPECT_TRUE(logged(LogLevel::Critical, "No memory for a line of the tallyd log file"));

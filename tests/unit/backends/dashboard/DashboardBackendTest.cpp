@@ -4,7 +4,7 @@
 #include <sys/socket.h>
 
 #include "DashboardFixture.h"
-#include "FailingAllocation.h"
+#include "support/FailingAllocation.h"
 
 namespace tallyd {
 namespace {
@@ -172,7 +172,7 @@ TEST_F(DashboardBackendTest, CountsTheTicksOfAFailedDatagramFromItsFirstSend) {
 TEST_F(DashboardBackendTest, DropsAMessageForWhichThereIsNoMemoryAndGoesOn) {
   const auto backend = made(profile());
   const Dictionary payload{{"a", 1}};
-  std::optional<test::FailingAllocation> failing(std::in_place, kDatagramBufferBytes);
+  std::optional<test::FailingLargeAllocations> failing(std::in_place, kDatagramBufferBytes);
   const auto line = backend->sendMessage(payload, kTime, 1, 0, 1);
   failing.reset();
   EXPECT_EQ(line, std::nullopt);

@@ -5,17 +5,13 @@
 #include <random>
 
 #include "DashboardFixture.h"
-#include "FailingAllocation.h"
 #include "backends/dashboard/DatagramSender.h"
 #include "backends/dashboard/LocalLog.h"
 #include "support/Account.h"
+#include "support/FailingAllocation.h"
 
 namespace tallyd {
 namespace {
-
-std::uint64_t droppedFor(const AccountCounts& counts, DropReason reason) {
-  return counts.dropped[static_cast<std::size_t>(reason)];
-}
 
 class DashboardBooksTest : public DashboardFixture {
  protected:
@@ -75,7 +71,7 @@ TEST_F(DashboardBooksTest, AReliableDatagramIsGivenUpAfterTheLastRetransmission)
   const auto backend = booked(reliableProfile());
   send(*backend, 5);
   fake.queues.advance(kPeriod * 20);
-  EXPECT_EQ(droppedFor(counts(), DropReason::GivenUp), 1U);
+  EXPECT_EQ(counts().droppedFor(DropReason::GivenUp), 1U);
   EXPECT_EQ(receivedEventIDs().size(), 5U);
   expectBalance();
 }
@@ -84,7 +80,7 @@ TEST_F(DashboardBooksTest, TheOldestOfTheFiftyFirstGoes) {
   const auto backend = booked(reliableProfile());
   for (std::uint16_t event = 1; event <= 53; ++event) send(*backend, event);
   fake.queues.run();
-  EXPECT_EQ(droppedFor(counts(), DropReason::QueueFull), 3U);
+  EXPECT_EQ(counts().droppedFor(DropReason::QueueFull), 3U);
   EXPECT_EQ(counts().inFlight, 50U);
   expectBalance();
 }
@@ -93,7 +89,7 @@ TEST_F(DashboardBooksTest, ADatagramForWhichTheQueueHasNoMemoryIsDropped) {
   const auto backend = booked(profile());
   fake.queues.refuseWork(1);
   EXPECT_EQ(backend->sendMessage(Dictionary{{"a", 1}}, kTime, 1, 0, 1), std::nullopt);
-  EXPECT_EQ(droppedFor(counts(), DropReason::OutOfMemory), 1U);
+  EXPECT_EQ(counts().droppedFor(DropReason::OutOfMemory), 1U);
   EXPECT_EQ(fake.log.lines(), kNoMemory);
   send(*backend, 2);
   fake.queues.run();
@@ -108,10 +104,10 @@ TEST_F(DashboardBooksTest, ADatagramWithoutMemoryForItsLineIsDropped) {
   backend->setUdid(broken.c_str());
   const Dictionary payload{{"a", std::string(1000, 'x')}};
   {
-    const test::FailingAllocation failing(kMaximumLocalLogBytes + 100);
+    const test::FailingLargeAllocations failing(kMaximumLocalLogBytes + 100);
     EXPECT_EQ(backend->sendMessage(payload, kTime, 1, 0, 1), std::nullopt);
   }
-  EXPECT_EQ(droppedFor(counts(), DropReason::OutOfMemory), 1U);
+  EXPECT_EQ(counts().droppedFor(DropReason::OutOfMemory), 1U);
   EXPECT_EQ(fake.log.lines(), kNoMemory);
   fake.queues.run();
   EXPECT_TRUE(receivedEventIDs().empty());
@@ -122,10 +118,10 @@ TEST_F(DashboardBooksTest, ADatagramThatCannotBeKeptForItsAcknowledgementIsDropp
   const auto backend = booked(reliableProfile());
   send(*backend, 1, std::string(2000, 'x'));
   {
-    const test::FailingAllocation failing(kDatagramBufferBytes - 1);
+    const test::FailingLargeAllocations failing(kDatagramBufferBytes - 1);
     fake.queues.run();
   }
-  EXPECT_EQ(droppedFor(counts(), DropReason::OutOfMemory), 1U);
+  EXPECT_EQ(counts().droppedFor(DropReason::OutOfMemory), 1U);
   EXPECT_EQ(fake.log.lines(), kNoMemory);
   fake.queues.advance(kPeriod * 20);
   EXPECT_EQ(receivedEventIDs(), std::vector<std::uint16_t>{1});
@@ -138,7 +134,7 @@ TEST_F(DashboardBooksTest, WhatACleanUpFindsAtItsLastResortIsDropped) {
   send(*backend, 1);
   backend->cleanup();
   fake.queues.advance(Seconds(60));
-  EXPECT_EQ(droppedFor(counts(), DropReason::CleanUp), 1U);
+  EXPECT_EQ(counts().droppedFor(DropReason::CleanUp), 1U);
   expectBalance();
 }
 
@@ -148,7 +144,7 @@ TEST_F(DashboardBooksTest, WhatADroppedBackendCouldNotSendIsDropped) {
   send(*backend, 1);
   backend = nullptr;
   fake.queues.advance(Seconds(200));
-  EXPECT_EQ(droppedFor(counts(), DropReason::CleanUp), 1U);
+  EXPECT_EQ(counts().droppedFor(DropReason::CleanUp), 1U);
   expectBalance();
 }
 
@@ -159,7 +155,7 @@ TEST_F(DashboardBooksTest, WhatComesAfterTheCleanUpIsBooked) {
   send(*backend, 1);
   fake.queues.run();
   EXPECT_EQ(counts().held + counts().inFlight, 0U);
-  EXPECT_EQ(droppedFor(counts(), DropReason::CleanUp), 1U);
+  EXPECT_EQ(counts().droppedFor(DropReason::CleanUp), 1U);
   expectBalance();
 }
 
@@ -170,7 +166,7 @@ TEST_F(DashboardBooksTest, LogDataIsBookedAsItsAnswerComes) {
   EXPECT_EQ(counts().sent, 2U);  // The data, and the datagram that tells of it.
   fake.http.answer = [](const auto&) { return fakes::FakeHTTPClient::failure("refused"); };
   EXPECT_FALSE(backend->uploadLogData(Array{"a"}));
-  EXPECT_EQ(droppedFor(counts(), DropReason::UploadFailed), 1U);
+  EXPECT_EQ(counts().droppedFor(DropReason::UploadFailed), 1U);
   fake.http.answer = [](const auto&) {
     return platform::HTTPResult{std::nullopt, platform::HTTPResponse{503, {}}, {}};
   };
@@ -178,7 +174,7 @@ TEST_F(DashboardBooksTest, LogDataIsBookedAsItsAnswerComes) {
   EXPECT_EQ(counts().refused, 1U);
   const auto without = booked(profile());
   EXPECT_FALSE(without->uploadLogData(Array{"a"}));
-  EXPECT_EQ(droppedFor(counts(), DropReason::NotUploadable), 1U);
+  EXPECT_EQ(counts().droppedFor(DropReason::NotUploadable), 1U);
   expectBalance();
 }
 
@@ -239,7 +235,7 @@ class DashboardFaultsTest : public DashboardBooksTest, public testing::WithParam
     takeReceived();
     if (mode == Mode::FireAndForget) {
       EXPECT_EQ(end.sent, arrivals);
-      EXPECT_EQ(droppedFor(end, DropReason::GivenUp), 0U);
+      EXPECT_EQ(end.droppedFor(DropReason::GivenUp), 0U);
     } else {
       EXPECT_EQ(end.sent, acknowledged);
       EXPECT_GE(distinct.size(), acknowledged);

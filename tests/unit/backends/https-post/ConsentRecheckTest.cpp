@@ -16,7 +16,7 @@ class ConsentRecheckTest : public HTTPSPostBackendFixture {
     return backend.sendMessage(Dictionary{{"i", 1}}, kEventTime, method, 4);
   }
   [[nodiscard]] std::uint64_t withdrawn() const {
-    return account->counts().dropped[static_cast<std::size_t>(DropReason::ConsentWithdrawn)];
+    return account->counts().droppedFor(DropReason::ConsentWithdrawn);
   }
   [[nodiscard]] std::size_t linesAbout(int events) const {
     return fake.log.count(Level::Info, "Tally(HTTPSPostBackend): consent has been withdrawn, not posting " +

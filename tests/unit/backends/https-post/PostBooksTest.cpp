@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <new>
 #include <random>
 
 #include "HTTPSPostBackendFixture.h"
@@ -14,10 +15,6 @@ using fakes::FakeHTTPClient;
 using platform::HTTPFailure;
 using platform::HTTPResponse;
 using platform::HTTPResult;
-
-std::uint64_t droppedFor(const AccountCounts& counts, DropReason reason) {
-  return counts.dropped[static_cast<std::size_t>(reason)];
-}
 
 class PostBooksTest : public HTTPSPostBackendFixture {
  protected:
@@ -71,16 +68,26 @@ TEST_F(PostBooksTest, TellsAFailedPostFromOneThatFoundNoMemory) {
   answerWith(tooMuch);
   send(*backend);
   fake.queues.run();
-  EXPECT_EQ(droppedFor(counts(), DropReason::PostFailed), 1U);
-  EXPECT_EQ(droppedFor(counts(), DropReason::MemoryBound), 1U);
+  EXPECT_EQ(counts().droppedFor(DropReason::PostFailed), 1U);
+  EXPECT_EQ(counts().droppedFor(DropReason::MemoryBound), 1U);
   expectBalance();
+}
+
+TEST_F(PostBooksTest, AnEventOfAPostThatCouldNotBeTakenOverIsDropped) {
+  const auto backend = booked(evaluated());
+  fake.http.answer = [](const auto&) -> HTTPResult { throw std::bad_alloc(); };
+  send(*backend);
+  fake.queues.run();
+  EXPECT_EQ(counts().droppedFor(DropReason::OutOfMemory), 1U);
+  EXPECT_EQ(counts().inFlight, 0U);
+  EXPECT_TRUE(fake.log.has(Level::Error, "Tally(HTTPSPostBackend): out of memory for a post of 1 events"));
 }
 
 TEST_F(PostBooksTest, AnEventOfABackendThatDoesNotReportIsDropped) {
   const auto backend = booked(evaluated({entryWithout("filters")}));
   ASSERT_EQ(backend->state(), ReportingStateOff);
   send(*backend);
-  EXPECT_EQ(droppedFor(counts(), DropReason::StateOff), 1U);
+  EXPECT_EQ(counts().droppedFor(DropReason::StateOff), 1U);
   EXPECT_EQ(postCount(), 0U);
 }
 
@@ -89,7 +96,7 @@ TEST_F(PostBooksTest, ABatchHoldsItsEventsAndDropsThoseOverTheLimit) {
   backend->setBatchEvents(true);
   for (int i = 0; i < 60; ++i) send(*backend);
   EXPECT_EQ(counts().held, 50U);
-  EXPECT_EQ(droppedFor(counts(), DropReason::MethodLimit), 10U);
+  EXPECT_EQ(counts().droppedFor(DropReason::MethodLimit), 10U);
   backend->flushMessages();
   EXPECT_EQ(counts().inFlight, 50U);
   fake.queues.run();
@@ -102,7 +109,7 @@ TEST_F(PostBooksTest, ABatchThatMayNotBePostedIsDroppedWithItsBackend) {
   for (int i = 0; i < 4; ++i) send(*backend);
   EXPECT_EQ(counts().held, 4U);
   backend = nullptr;
-  EXPECT_EQ(droppedFor(counts(), DropReason::CleanUp), 4U);
+  EXPECT_EQ(counts().droppedFor(DropReason::CleanUp), 4U);
   EXPECT_EQ(postCount(), 0U);
   expectBalance();
 }
@@ -218,11 +225,11 @@ TEST_P(PostFaultsTest, TheBooksBalanceAtEveryStepAndAgreeWithTheCollector) {
   EXPECT_EQ(end.inFlight, 0U);
   EXPECT_EQ(end.sent, received);
   EXPECT_EQ(end.refused, refused);
-  EXPECT_EQ(droppedFor(end, DropReason::PostFailed), failed);
-  EXPECT_EQ(droppedFor(end, DropReason::MemoryBound), tooMuch);
+  EXPECT_EQ(end.droppedFor(DropReason::PostFailed), failed);
+  EXPECT_EQ(end.droppedFor(DropReason::MemoryBound), tooMuch);
   EXPECT_GT(received, 0U);
-  EXPECT_GT(droppedFor(end, DropReason::MethodLimit), 0U);
-  EXPECT_GT(droppedFor(end, DropReason::StateOff), 0U);
+  EXPECT_GT(end.droppedFor(DropReason::MethodLimit), 0U);
+  EXPECT_GT(end.droppedFor(DropReason::StateOff), 0U);
 }
 
 INSTANTIATE_TEST_SUITE_P(Seeds, PostFaultsTest, testing::Range(1U, 13U));

@@ -6,9 +6,9 @@
 #include <deque>
 #include <new>
 
-#include "../OneFailingAllocation.h"
 #include "HTTPClientFixture.h"
 #include "platform/http/CurlHandles.h"
+#include "support/FailingAllocation.h"
 #include "support/LoopbackServer.h"
 #include "support/RawServer.h"
 

@@ -8,10 +8,10 @@
 #include <optional>
 #include <thread>
 
-#include "../OneFailingAllocation.h"
 #include "Gate.h"
 #include "platform/FileDescriptor.h"
 #include "platform/queues/AsioQueues.h"
+#include "support/FailingAllocation.h"
 
 namespace tallyd::platform {
 namespace {

@@ -1,7 +1,7 @@
-#include "OneFailingAllocation.h"
+#include "support/FailingAllocation.h"
 
 #include <atomic>
-#include <cstddef>
+#include <cstdint>
 #include <cstdlib>
 #include <new>
 
@@ -12,8 +12,10 @@ namespace {
 
 std::atomic<std::thread::id> failingThread;
 std::atomic<int> allocationsLeft{0};  ///< Up to and with the one that fails.
+thread_local std::size_t smallestFailing = SIZE_MAX;
 
-bool isToFail() {
+bool isToFail(std::size_t size) {
+  if (size >= smallestFailing) return true;
   return allocationsLeft.load() > 0 && failingThread.load() == std::this_thread::get_id() &&
          allocationsLeft.fetch_sub(1) == 1;
 }
@@ -21,7 +23,7 @@ bool isToFail() {
 }  // namespace
 
 void* operator new(std::size_t size, const std::nothrow_t&) noexcept {
-  return isToFail() ? nullptr : std::malloc(size == 0 ? 1 : size);
+  return isToFail(size) ? nullptr : std::malloc(size == 0 ? 1 : size);
 }
 
 void* operator new(std::size_t size) {
@@ -42,5 +44,11 @@ OneFailingAllocation::OneFailingAllocation(std::thread::id thread, int number) {
 OneFailingAllocation::~OneFailingAllocation() { allocationsLeft = 0; }
 
 bool OneFailingAllocation::hasFailed() const { return allocationsLeft.load() <= 0; }
+
+FailingLargeAllocations::FailingLargeAllocations(std::size_t smallestBytes) {
+  smallestFailing = smallestBytes;
+}
+
+FailingLargeAllocations::~FailingLargeAllocations() { smallestFailing = SIZE_MAX; }
 
 }  // namespace tallyd::test

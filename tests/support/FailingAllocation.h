@@ -1,6 +1,7 @@
-// Makes one chosen allocation of one thread fail.
+// Makes chosen allocations fail.
 #pragma once
 
+#include <cstddef>
 #include <thread>
 
 namespace tallyd::test {
@@ -16,6 +17,15 @@ class OneFailingAllocation {
 
   /// False when the thread has not made as many allocations.
   [[nodiscard]] bool hasFailed() const;
+};
+
+/// While it lives, the calling thread gets no memory of `smallestBytes` or more from operator new.
+class FailingLargeAllocations {
+ public:
+  explicit FailingLargeAllocations(std::size_t smallestBytes);
+  ~FailingLargeAllocations();
+  FailingLargeAllocations(const FailingLargeAllocations&) = delete;
+  FailingLargeAllocations& operator=(const FailingLargeAllocations&) = delete;
 };
 
 }  // namespace tallyd::test
