@@ -95,11 +95,16 @@ void TallydAgent::serve(const std::shared_ptr<TallydSession>& session,
   connection->resume();
 }
 
-/// The caller holds the session: no reference that goes here is the last.
+/// Takes no memory. The caller holds the session: no reference that goes here is the last.
 void TallydAgent::forget(const TallydSession& session) {
   const std::lock_guard lock(_mutex);
   removeFrom(_sessionList, session);
   _connections.erase(&session);
+  const auto joined = _groupOfSession.find(&session);
+  if (joined == _groupOfSession.end()) return;
+  const auto group = _correlatedSessions.find(joined->second);
+  if (group != _correlatedSessions.end()) removeFrom(group->second, session);
+  _groupOfSession.erase(joined);
 }
 
 void TallydAgent::endSessions() {
@@ -118,18 +123,11 @@ std::pair<std::size_t, std::size_t> TallydAgent::counts() {
   return {_sessionList.size(), _correlatedSessions.size()};
 }
 
+/// Nothing stays listed when there is no memory for the line.
 void TallydAgent::connectionInvalidated(const std::shared_ptr<TallydSession>& session) {
-  asl_log(_platform.log, LogLevel::Debug, "XPC connection to {} was invalidated", session->description());
+  forget(*session);
   _ledger->connectionEnded();
-  const std::string key = correlationKeyForUserInfo(session->userInfo());
-  // The caller holds the session: no reference that goes here is the last.
-  const std::lock_guard lock(_mutex);
-  removeFrom(_sessionList, *session);
-  _connections.erase(session.get());
-  if (const auto group = _correlatedSessions.find(key); group != _correlatedSessions.end()) {
-    removeFrom(group->second, *session);
-  }
-  _groupOfSession.erase(session.get());
+  asl_log(_platform.log, LogLevel::Debug, "XPC connection to {} was invalidated", session->description());
 }
 
 std::optional<platform::Dictionary> TallydAgent::storebagForSession(const TallydSession& session) {
