@@ -247,33 +247,35 @@ namespace {
 
 // Reading
 
-/// The number at the end of `text`; nothing for one that is too big.
-std::optional<double> numberThatEnds(std::string_view text) {
-  const auto before = text.find_last_not_of("0123456789+-.eE");
-  text.remove_prefix(before == std::string_view::npos ? 0 : before + 1);
-  double number = 0;
-  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
-  return error == std::errc() ? std::optional(number) : std::nullopt;
+/// The JSON number that is all of `text`, if it has one of type `Number`.
+template <class Number>
+std::optional<Number> numberIn(std::string_view text) {
+  Number number{};
+  const char* const end = text.data() + text.size();
+  const auto [stop, error] = std::from_chars(text.data(), end, number);
+  return error == std::errc() && stop == end ? std::optional(number) : std::nullopt;
+}
+
+/// An integer where 64 bits hold it, else the nearest real number; nothing when that is infinite.
+std::optional<Value> valueOfNumber(std::string_view text) {
+  if (const auto number = numberIn<std::int64_t>(text)) return Value(*number);
+  if (const auto number = numberIn<std::uint64_t>(text)) return Value(*number);
+  if (const auto number = numberIn<double>(text)) return Value(*number);
+  // Beyond the doubles. The reader refuses exponents that would be beyond these, but for those toward zero.
+  const auto wide = numberIn<long double>(text).value_or(0);
+  if (std::fabs(wide) > 1) return std::nullopt;
+  return Value(static_cast<double>(wide));
 }
 
 /// Builds a value from the reader's events; refuses what is nested too deep.
 class ValueBuilder : public rapidjson::BaseReaderHandler<rapidjson::UTF8<>, ValueBuilder> {
  public:
-  /// Borrows what is read, and where it has got to.
-  ValueBuilder(std::string_view text, const rapidjson::MemoryStream& stream) : _text(text), _stream(stream) {}
-
   bool Null() { return add(Value()); }
   bool Bool(bool value) { return add(Value(value)); }
-  bool Int(int value) { return add(Value(value)); }
-  bool Uint(unsigned value) { return add(Value(value)); }
-  bool Int64(std::int64_t value) { return add(Value(value)); }
-  bool Uint64(std::uint64_t value) { return add(Value(value)); }
-  bool Double(double value) {
-    // Of the largest numbers that there are the library makes none.
-    const auto exact =
-        std::isfinite(value) ? std::optional(value) : numberThatEnds(_text.substr(0, _stream.Tell()));
-    if (!exact) _isTooBig = true;
-    return exact && add(Value(*exact));
+  bool RawNumber(const char* text, rapidjson::SizeType length, bool /*copy*/) {
+    auto value = valueOfNumber({text, length});
+    _isTooBig = !value;
+    return value && add(*std::move(value));
   }
   bool String(const char* text, rapidjson::SizeType length, bool /*copy*/) {
     return add(Value(std::string(text, length)));
@@ -326,8 +328,6 @@ class ValueBuilder : public rapidjson::BaseReaderHandler<rapidjson::UTF8<>, Valu
     return true;
   }
 
-  const std::string_view _text;
-  const rapidjson::MemoryStream& _stream;
   std::vector<Open> _open;
   Value _root;
   bool _isTooBig = false;
@@ -349,13 +349,15 @@ std::optional<std::string> jsonFromValue(const Value& value) {
 }
 
 JSONResult valueFromJSON(std::string_view text) {
-  constexpr unsigned kFlags = rapidjson::kParseFullPrecisionFlag | rapidjson::kParseValidateEncodingFlag;
+  // The library's own conversion makes a NaN of the largest numbers and takes undefined steps with some
+  // zeros.
+  constexpr unsigned kFlags = rapidjson::kParseNumbersAsStringsFlag | rapidjson::kParseValidateEncodingFlag;
   constexpr std::string_view kByteOrderMark = "\xEF\xBB\xBF";
   const std::size_t skipped = text.starts_with(kByteOrderMark) ? kByteOrderMark.size() : 0;
   text.remove_prefix(skipped);
   rapidjson::MemoryStream stream(text.data(), text.size());
   rapidjson::Reader reader;
-  ValueBuilder builder(text, stream);
+  ValueBuilder builder;
   if (!reader.Parse<kFlags>(stream, builder)) {
     const auto code = builder.isTooBig() ? rapidjson::kParseErrorNumberTooBig : reader.GetParseErrorCode();
     return {std::nullopt, errorText(code, skipped + reader.GetErrorOffset())};

@@ -45,7 +45,7 @@ std::optional<std::string> repeatedKey(std::string_view text) {
   if (text.starts_with(kByteOrderMark)) text.remove_prefix(kByteOrderMark.size());
   rapidjson::MemoryStream stream(text.data(), text.size());
   RepeatedKeyFinder finder;
-  rapidjson::Reader().Parse(stream, finder);
+  rapidjson::Reader().Parse<rapidjson::kParseNumbersAsStringsFlag>(stream, finder);
   return finder.repeated();
 }
 

@@ -176,7 +176,19 @@ TEST(JSONTest, ReadsTheLargestNumbersThatThereAre) {
     EXPECT_EQ(valueFromJSON(*text).value, Value(largest)) << *text;
     EXPECT_EQ(valueFromJSON("[1," + *text + "]").value, (Value(Array{1, largest})));
   }
-  EXPECT_FALSE(valueFromJSON("[1.7976931348623159e308]").value);
+  for (const char* larger : {"[1.7976931348623159e308]", "[-0.9e309]", "9e308", "1e99999"}) {
+    EXPECT_EQ(valueFromJSON(larger).error.substr(0, 44), "Number too big to be stored in double. (at b")
+        << larger;
+  }
+}
+
+TEST(JSONTest, ReadsZerosOfAnyExponentAndWhatIsNextToZero) {
+  for (const char* zero : {"0e48", "0e308", "0.0e-5", "0e-99999999999", "1e-400", "1e-99999", "-0"}) {
+    EXPECT_EQ(valueFromJSON(zero).value->realValue(), 0.0) << zero;
+  }
+  EXPECT_TRUE(std::signbit(*valueFromJSON("-0.0").value->realValue()));
+  EXPECT_EQ(valueFromJSON("5e-324").value, Value(std::numeric_limits<double>::denorm_min()));
+  EXPECT_EQ(valueFromJSON("0." + std::string(400, '0') + "1").value, Value(0.0));
 }
 
 TEST(JSONTest, ReadsBackWhatItWrites) {
