@@ -124,6 +124,7 @@ TEST(JSONTest, ReadsIntegersWithAll64BitsAndLargerOnesAsReals) {
   EXPECT_EQ(valueFromJSON("9223372036854775807").value, Value(std::numeric_limits<std::int64_t>::max()));
   EXPECT_EQ(valueFromJSON("-9223372036854775808").value, Value(std::numeric_limits<std::int64_t>::min()));
   EXPECT_EQ(valueFromJSON("18446744073709551616").value, Value(18446744073709551616.0));
+  EXPECT_EQ(valueFromJSON("184467440737095516158").value, Value(184467440737095516158.0));
   EXPECT_EQ(valueFromJSON("4294967295").value, Value(std::int64_t{4294967295}));
 }
 
