@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "FuzzTarget.h"
+#include "ValueDepth.h"
 #include "platform/Value.h"
 #include "platform/dbus/BodyReader.h"
 #include "platform/dbus/BodyWriter.h"
@@ -27,20 +28,6 @@ void checkSignature(std::string_view signature) {
     FUZZ_CHECK(isOneCompleteType(rest.substr(0, length)));
     rest.remove_prefix(length);
   }
-}
-
-/// Levels of containers, an empty one included.
-int depthOf(const Value& value) {
-  int deepest = 0;
-  if (const auto* array = value.array()) {
-    for (const Value& element : *array) deepest = std::max(deepest, depthOf(element));
-    return deepest + 1;
-  }
-  if (const auto* dictionary = value.dictionary()) {
-    for (const auto& entry : *dictionary) deepest = std::max(deepest, depthOf(entry.value));
-    return deepest + 1;
-  }
-  return 0;
 }
 
 std::optional<std::string> written(std::string_view signature, const std::vector<Value>& values) {

@@ -3,6 +3,7 @@
 #include <string>
 
 #include "FuzzTarget.h"
+#include "ValueDepth.h"
 #include "platform/property-list/KeyedArchive.h"
 #include "platform/property-list/PropertyList.h"
 
@@ -10,19 +11,6 @@ namespace tallyd::fuzz {
 namespace {
 
 using namespace platform;
-
-int depthOf(const Value& value) {
-  int deepest = 0;
-  if (const auto* array = value.array()) {
-    for (const Value& element : *array) deepest = std::max(deepest, depthOf(element));
-    return deepest + 1;
-  }
-  if (const auto* dictionary = value.dictionary()) {
-    for (const auto& entry : *dictionary) deepest = std::max(deepest, depthOf(entry.value));
-    return deepest + 1;
-  }
-  return 0;
-}
 
 /// What was written can be read, and what was read back reads the same ever after. Once it may change: what a
 /// form can't carry is replaced, and keys that this changes are sorted anew. The values count, not the bytes:

@@ -25,15 +25,13 @@ std::size_t contentLength(std::string_view header) {
 
 }  // namespace
 
-bool RawConnection::readMore() {
-  std::array<char, 4096> buffer;
-  const ssize_t count = ::recv(_descriptor, buffer.data(), buffer.size(), 0);
-  if (count <= 0) return false;
-  _received.append(buffer.data(), static_cast<std::size_t>(count));
-  return true;
+bool RequestReader::readMore() {
+  const std::string bytes = nextBytes();
+  _received += bytes;
+  return !bytes.empty();
 }
 
-std::string RawConnection::readRequest() {
+std::string RequestReader::readRequest() {
   while (true) {
     const auto size = requestSize(_received);
     if (size && _received.size() >= *size) {
@@ -45,16 +43,22 @@ std::string RawConnection::readRequest() {
   }
 }
 
+void RequestReader::waitForClose() {
+  while (readMore()) {
+  }
+}
+
+std::string RawConnection::nextBytes() {
+  std::array<char, 4096> buffer;
+  const ssize_t count = ::recv(_descriptor, buffer.data(), buffer.size(), 0);
+  return {buffer.data(), count > 0 ? static_cast<std::size_t>(count) : 0};
+}
+
 void RawConnection::write(std::string_view bytes) {
   while (!bytes.empty()) {
     const ssize_t count = ::send(_descriptor, bytes.data(), bytes.size(), MSG_NOSIGNAL);
     if (count <= 0) return;
     bytes.remove_prefix(static_cast<std::size_t>(count));
-  }
-}
-
-void RawConnection::waitForClose() {
-  while (readMore()) {
   }
 }
 

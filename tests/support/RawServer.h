@@ -14,18 +14,32 @@
 
 namespace tallyd::test {
 
-/// One accepted connection, as the script sees it.
-class RawConnection {
+/// What comes from a client, request by request.
+class RequestReader {
  public:
-  RawConnection(int descriptor, int number) : _descriptor(descriptor), _number(number) {}
+  virtual ~RequestReader() = default;
 
   /// The bytes of one request, header and body (of its Content-Length); empty when the client has hung up.
   [[nodiscard]] std::string readRequest();
-  void write(std::string_view bytes);
   /// Waits for the first bytes of a request and leaves them; false when the client has hung up.
   [[nodiscard]] bool waitForBytes() { return !_received.empty() || readMore(); }
   /// Waits until the client hangs up or the server goes away.
   void waitForClose();
+
+ private:
+  /// The next bytes, as they come; empty when the client has hung up.
+  [[nodiscard]] virtual std::string nextBytes() = 0;
+  [[nodiscard]] bool readMore();
+
+  std::string _received;
+};
+
+/// One accepted connection, as the script sees it.
+class RawConnection : public RequestReader {
+ public:
+  RawConnection(int descriptor, int number) : _descriptor(descriptor), _number(number) {}
+
+  void write(std::string_view bytes);
   /// Closes the connection so that the client's next look at it is an error (TCP's RST).
   void reset() const;
   /// Which accepted connection this is, from 1.
@@ -33,11 +47,10 @@ class RawConnection {
   [[nodiscard]] int descriptor() const { return _descriptor; }
 
  private:
-  [[nodiscard]] bool readMore();
+  [[nodiscard]] std::string nextBytes() override;
 
   const int _descriptor;
   const int _number;
-  std::string _received;
 };
 
 /// Runs the script once for each connection, each on a thread of its own, and closes the connection after it.

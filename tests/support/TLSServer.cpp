@@ -28,24 +28,10 @@ TLSConnection::TLSConnection(RawConnection& connection, void* context)
 
 TLSConnection::~TLSConnection() = default;
 
-bool TLSConnection::readMore() {
+std::string TLSConnection::nextBytes() {
   std::array<char, 16'384> buffer;
   const int count = SSL_read(_session->tls, buffer.data(), static_cast<int>(buffer.size()));
-  if (count <= 0) return false;
-  _received.append(buffer.data(), static_cast<std::size_t>(count));
-  return true;
-}
-
-std::string TLSConnection::readRequest() {
-  while (true) {
-    const auto size = requestSize(_received);
-    if (size && _received.size() >= *size) {
-      std::string request = _received.substr(0, *size);
-      _received.erase(0, *size);
-      return request;
-    }
-    if (!readMore()) return {};
-  }
+  return {buffer.data(), count > 0 ? static_cast<std::size_t>(count) : 0};
 }
 
 bool TLSConnection::writeAll(std::string_view bytes) {
@@ -55,11 +41,6 @@ bool TLSConnection::writeAll(std::string_view bytes) {
 void TLSConnection::close() {
   SSL_shutdown(_session->tls);
   ::shutdown(_connection.descriptor(), SHUT_RDWR);
-}
-
-void TLSConnection::waitForClose() {
-  while (readMore()) {
-  }
 }
 
 struct TLSServer::Context {

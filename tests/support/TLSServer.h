@@ -12,37 +12,30 @@
 namespace tallyd::test {
 
 /// One connection after its handshake, as the script sees it.
-class TLSConnection {
+class TLSConnection : public RequestReader {
  public:
   /// Takes part in the handshake.
   TLSConnection(RawConnection& connection, void* context);
-  ~TLSConnection();
+  ~TLSConnection() override;
   TLSConnection(const TLSConnection&) = delete;
   TLSConnection& operator=(const TLSConnection&) = delete;
 
-  /// The bytes of one request, header and body (of its Content-Length); empty when the client has hung up.
-  [[nodiscard]] std::string readRequest();
   void write(std::string_view bytes) { static_cast<void>(writeAll(bytes)); }
   /// False when the client has hung up.
   [[nodiscard]] bool writeAll(std::string_view bytes);
-  /// Waits for the first bytes of a request and leaves them; false when the client has hung up.
-  [[nodiscard]] bool waitForBytes() { return !_received.empty() || readMore(); }
   /// Says that nothing more comes (RFC 8446, section 6.1) and closes the connection.
   void close();
   /// Closes the connection without a word (TCP's RST).
   void reset() const { _connection.reset(); }
-  /// Waits until the client hangs up or the server goes away.
-  void waitForClose();
   /// Which accepted connection this is, from 1.
   [[nodiscard]] int number() const { return _connection.number(); }
 
  private:
-  [[nodiscard]] bool readMore();
+  [[nodiscard]] std::string nextBytes() override;
 
   struct Session;
   RawConnection& _connection;
   const std::unique_ptr<Session> _session;
-  std::string _received;
 };
 
 /// Runs the script once for each connection whose handshake succeeds, each on a thread of its own.

@@ -8,6 +8,7 @@
 #include "platform/property-list/PropertyList.h"
 #include "signing/StorebagSigning.h"
 #include "station/Files.h"
+#include "station/HTTPStatus.h"
 
 namespace tallyd::station {
 
@@ -37,12 +38,12 @@ bool isPlainName(const std::string& name) {
 Answer BagFolder::storebag(const std::string& name) const {
   const std::filesystem::path file = _directory / (name + ".plist");
   if (!isPlainName(name) || !std::filesystem::exists(file)) {
-    return {404, fmt::format("There is no storebag \"{}\" in {}\n", name, _directory.string())};
+    return {kNotFound, fmt::format("There is no storebag \"{}\" in {}\n", name, _directory.string())};
   }
   try {
-    return {200, signing::signedStorebag(_key, parseBag(readFile(file)), PropertyListFormat::Binary)};
+    return {kOK, signing::signedStorebag(_key, parseBag(readFile(file)), PropertyListFormat::Binary)};
   } catch (const std::exception& exception) {
-    return {500, fmt::format("{} is not a storebag: {}\n", file.string(), exception.what())};
+    return {kServerError, fmt::format("{} is not a storebag: {}\n", file.string(), exception.what())};
   }
 }
 

@@ -9,12 +9,11 @@
 #include <new>
 #include <utility>
 
+#include "station/HTTPStatus.h"
+
 namespace tallyd::station {
 
 namespace {
-
-constexpr int kBadRequest = 400;
-constexpr int kTooLarge = 413;
 
 /// zlib.h, inflateInit2: 15 is the largest window; 16 more takes gzip and nothing else.
 constexpr int kGzipWindowBits = 15 + 16;
@@ -73,7 +72,7 @@ void BodyDecoder::finish() const {
 void BodyDecoder::hand(std::string_view decoded) {
   if (decoded.empty()) return;
   if (decoded.size() > _limit - _decodedBytes) {
-    throw BodyError(kTooLarge, fmt::format("the body has more than {} bytes", _limit));
+    throw BodyError(kContentTooLarge, fmt::format("the body has more than {} bytes", _limit));
   }
   _decodedBytes += decoded.size();
   _sink(decoded);

@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "platform/JSON.h"
+#include "station/HTTPStatus.h"
 #include "station/ReadableText.h"
 
 namespace tallyd::station {
@@ -15,10 +16,6 @@ using platform::Dictionary;
 using platform::Value;
 
 namespace {
-
-constexpr int kOK = 200;
-constexpr int kBadRequest = 400;
-constexpr int kServerError = 500;
 
 PostResult problem(std::string text) { return {std::nullopt, std::move(text)}; }
 

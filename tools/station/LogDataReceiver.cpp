@@ -9,6 +9,7 @@
 #include "platform/JSON.h"
 #include "station/BodyDecoder.h"
 #include "station/Files.h"
+#include "station/HTTPStatus.h"
 #include "station/KeyedArchiveReader.h"
 #include "station/Limits.h"
 #include "station/ReadableText.h"
@@ -20,10 +21,6 @@ using platform::Dictionary;
 using platform::Value;
 
 namespace {
-
-constexpr int kOK = 200;
-constexpr int kBadRequest = 400;
-constexpr int kServerError = 500;
 
 /// RFC 1952, section 2.3.1.
 constexpr std::string_view kGzipStart = "\x1F\x8B";

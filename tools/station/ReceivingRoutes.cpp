@@ -6,6 +6,7 @@
 #include <optional>
 #include <string>
 
+#include "station/HTTPStatus.h"
 #include "station/Limits.h"
 #include "station/RequestBody.h"
 
@@ -16,8 +17,6 @@ namespace {
 constexpr const char* kEventsPath = R"(/events(?:/.*)?)";
 constexpr const char* kUploadPath = "/upload";
 constexpr const char* kLogDataPath = "/log-data";
-
-constexpr int kServerError = 500;
 
 using httplib::ContentReader;
 using httplib::Request;

@@ -6,14 +6,13 @@
 #include <exception>
 #include <utility>
 
+#include "station/HTTPStatus.h"
+
 namespace tallyd::station {
 
 namespace {
 
 constexpr const char* kContentEncoding = "Content-Encoding";
-constexpr int kBadRequest = 400;
-constexpr int kUnsupportedEncoding = 415;
-constexpr int kServerError = 500;
 
 /// Keeps the library from decoding: it takes a gzip body without its trailer for a whole one. Its reader asks
 /// the request's headers when it is called, and the request is the library's own and no constant.
@@ -37,7 +36,8 @@ BodyResult readBody(const httplib::Request& request, const httplib::ContentReade
   if (encoding) {
     result.encoding = BodyDecoder::nameOf(*encoding);
   } else {
-    fail(result, kUnsupportedEncoding, fmt::format("the body's encoding is not known ({})", result.encoding));
+    fail(result, kUnsupportedMediaType,
+         fmt::format("the body's encoding is not known ({})", result.encoding));
   }
   BodyDecoder decoder(encoding.value_or(BodyDecoder::Encoding::Identity), limit, std::move(sink));
   const auto attempt = [&result](auto&& step) {

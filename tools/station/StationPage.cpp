@@ -10,6 +10,7 @@
 #include <string_view>
 #include <utility>
 
+#include "station/HTTPStatus.h"
 #include "station/IncomingFile.h"
 #include "station/Limits.h"
 #include "station/PageFiles.h"
@@ -24,7 +25,6 @@ using httplib::Response;
 constexpr int kFound = 302;
 constexpr int kNotModified = 304;
 constexpr int kForbidden = 403;
-constexpr int kNotFound = 404;
 constexpr int kMisdirected = 421;
 constexpr int kUnavailable = 503;
 

@@ -11,6 +11,7 @@
 #include <string>
 #include <thread>
 
+#include "station/HTTPStatus.h"
 #include "station/Limits.h"
 
 namespace tallyd::station {
@@ -18,7 +19,6 @@ namespace tallyd::station {
 namespace {
 
 constexpr const char* kAddress = "127.0.0.1";
-constexpr int kServerError = 500;
 
 void answerException(const httplib::Request&, httplib::Response& response, std::exception_ptr thrown) {
   response.status = kServerError;

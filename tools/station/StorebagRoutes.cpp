@@ -3,6 +3,8 @@
 #include <fmt/format.h>
 #include <httplib.h>
 
+#include "station/HTTPStatus.h"
+
 namespace tallyd::station {
 
 namespace {
@@ -19,7 +21,7 @@ void StorebagRoutes::addTo(httplib::Server& server) {
     const std::string name = request.matches[1];
     const Answer answer = _bags.storebag(name);
     response.status = answer.status;
-    if (answer.status != 200) {
+    if (answer.status != kOK) {
       response.set_content(answer.body, "text/plain; charset=utf-8");
       _view.showProblem(answer.body.substr(0, answer.body.find('\n')));
       return;

@@ -6,6 +6,7 @@
 #include <chrono>
 #include <exception>
 
+#include "station/HTTPStatus.h"
 #include "station/ReadableText.h"
 
 namespace tallyd::station {
@@ -15,8 +16,6 @@ using platform::Value;
 
 namespace {
 
-constexpr int kOK = 200;
-constexpr int kServerError = 500;
 constexpr std::string_view kSuccess = "success";
 
 Value valueOf(const std::optional<std::string>& text) { return text ? Value(*text) : Value(); }

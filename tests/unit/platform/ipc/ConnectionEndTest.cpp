@@ -10,22 +10,11 @@ namespace {
 
 class ConnectionEndTest : public IPCTest {
  protected:
-  /// What came after the connection was accepted, but for calls and the description.
-  std::vector<std::string> endEvents() {
-    EXPECT_TRUE(_service.events.waitFor("dropped"));
-    std::vector<std::string> ends;
-    for (const auto& event : _service.events.all()) {
-      if (event == "interrupted" || event == "invalidated" || event == "dropped") ends.push_back(event);
-    }
-    return ends;
-  }
   /// Authenticates and makes a first call.
   static void greet(RawClient& client) {
     client.authenticate().send(rawCall(1, "Nothing"));
     ASSERT_TRUE(client.receiveMessage());
   }
-  const std::vector<std::string> kInterrupted{"interrupted", "invalidated", "dropped"};
-  const std::vector<std::string> kInvalidatedOnly{"invalidated", "dropped"};
 };
 
 TEST_F(ConnectionEndTest, ClosingBetweenMessagesOnlyInvalidates) {

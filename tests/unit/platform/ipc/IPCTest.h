@@ -39,6 +39,19 @@ class IPCTest : public testing::Test {
     return promise->get_future().get();
   }
 
+  /// What came after the connection was accepted, but for calls and the description; waits for its end.
+  std::vector<std::string> endEvents() {
+    EXPECT_TRUE(_service.events.waitFor("dropped"));
+    std::vector<std::string> ends;
+    for (const auto& event : _service.events.all()) {
+      if (event == "interrupted" || event == "invalidated" || event == "dropped") ends.push_back(event);
+    }
+    return ends;
+  }
+
+  const std::vector<std::string> kInterrupted{"interrupted", "invalidated", "dropped"};
+  const std::vector<std::string> kInvalidatedOnly{"invalidated", "dropped"};
+
   fakes::TemporaryFolder _folder;
   const std::filesystem::path _socketPath = _folder.path() / "run/service";
   fakes::FakeLog _log;

@@ -204,52 +204,51 @@ TEST(AsioQueuesDeathTest, EndsTheProcessForWorkThatThrowsWithoutALog) {
       "a reason");
 }
 
-class BlockedQueuesTest : public testing::TestWithParam<std::size_t> {};
+class BlockedQueuesTest : public testing::TestWithParam<std::size_t> {
+ protected:
+  static constexpr int kBlocked = 40;
+
+  /// So many queues with work that blocks until it is released.
+  struct BlockedCalls {
+    explicit BlockedCalls(AsioQueues& queues) {
+      for (int i = 0; i < kBlocked; ++i) {
+        queues.makeSerialQueue("blocked")->async([this, &queues] {
+          {
+            const auto call = queues.blockingCall();
+            blocked.pass();
+            EXPECT_TRUE(release.waitFor(1));
+          }
+          ended.pass();
+        });
+      }
+    }
+
+    Gate blocked;
+    Gate release;
+    Gate ended;
+  };
+};
 
 TEST_P(BlockedQueuesTest, AnyNumberOfBlockedCallsDelaysNoOtherQueue) {
-  constexpr int kBlocked = 40;
   AsioQueues queues(GetParam());
-  Gate blocked;
-  Gate release;
-  Gate ended;
-  for (int i = 0; i < kBlocked; ++i) {
-    queues.makeSerialQueue("blocked")->async([&] {
-      const auto call = queues.blockingCall();
-      blocked.pass();
-      EXPECT_TRUE(release.waitFor(1));
-      ended.pass();
-    });
-  }
-  ASSERT_TRUE(blocked.waitFor(kBlocked));
+  BlockedCalls calls(queues);
+  ASSERT_TRUE(calls.blocked.waitFor(kBlocked));
   Gate other;
   queues.makeSerialQueue("other")->async([&] { other.pass(); });
   EXPECT_TRUE(other.waitFor(1));
   EXPECT_EQ(queues.threadCount(), GetParam() + kBlocked);
-  release.pass();
-  ASSERT_TRUE(ended.waitFor(kBlocked));
+  calls.release.pass();
+  ASSERT_TRUE(calls.ended.waitFor(kBlocked));
 }
 
 TEST_P(BlockedQueuesTest, SurplusThreadsLeaveAndAFewAreKeptForTheNextCalls) {
-  constexpr int kBlocked = 40;
   AsioQueues queues(GetParam());
   for (int round = 0; round < 3; ++round) {
-    Gate blocked;
-    Gate release;
-    Gate ended;
-    for (int i = 0; i < kBlocked; ++i) {
-      queues.makeSerialQueue("blocked")->async([&] {
-        {
-          const auto call = queues.blockingCall();
-          blocked.pass();
-          EXPECT_TRUE(release.waitFor(1));
-        }
-        ended.pass();
-      });
-    }
-    ASSERT_TRUE(blocked.waitFor(kBlocked));
+    BlockedCalls calls(queues);
+    ASSERT_TRUE(calls.blocked.waitFor(kBlocked));
     EXPECT_LE(queues.threadCount(), GetParam() + kBlocked);
-    release.pass();
-    ASSERT_TRUE(ended.waitFor(kBlocked));
+    calls.release.pass();
+    ASSERT_TRUE(calls.ended.waitFor(kBlocked));
     const auto deadline = std::chrono::steady_clock::now() + Gate::kDeadline;
     while (queues.threadCount() > GetParam() + GrowingPool::kMaximumParked) {
       ASSERT_LT(std::chrono::steady_clock::now(), deadline);
