@@ -34,16 +34,29 @@ union ControlBuffer {
   std::array<char, CMSG_SPACE(kDescriptorsInMessage * sizeof(int))> bytes;
 };
 
-void collectDescriptors(msghdr& message, std::vector<FileDescriptor>& descriptors) {
+/// False when there was no memory to keep one; that one is closed.
+bool keep(FileDescriptor descriptor, std::vector<FileDescriptor>& descriptors) {
+  try {
+    descriptors.push_back(std::move(descriptor));
+    return true;
+  } catch (const std::bad_alloc&) {
+    return false;
+  }
+}
+
+/// False when not all could be kept.
+bool collectDescriptors(msghdr& message, std::vector<FileDescriptor>& descriptors) {
+  bool keptAll = true;
   for (cmsghdr* part = CMSG_FIRSTHDR(&message); part != nullptr; part = CMSG_NXTHDR(&message, part)) {
     if (part->cmsg_level != SOL_SOCKET || part->cmsg_type != SCM_RIGHTS) continue;
     const std::size_t count = (part->cmsg_len - CMSG_LEN(0)) / sizeof(int);
     for (std::size_t i = 0; i < count; ++i) {
       int descriptor = -1;
       std::memcpy(&descriptor, CMSG_DATA(part) + i * sizeof(int), sizeof descriptor);
-      descriptors.emplace_back(descriptor);
+      keptAll = keep(FileDescriptor(descriptor), descriptors) && keptAll;
     }
   }
+  return keptAll;
 }
 
 ssize_t sendWithDescriptors(int socket, std::string_view bytes,
@@ -75,11 +88,14 @@ DBusConnection::~DBusConnection() = default;
 void DBusConnection::start(std::unique_ptr<dbus::Authentication> authentication) {
   if (_isStarted || _hasEnded) return;
   _isStarted = true;
-  _output += authentication->opening();
-  _authentication = std::move(authentication);
-  _authenticationTimer = _queue->makeTimer(kAuthenticationTime, kAuthenticationTime,
-                                           [self = shared_from_this()] { self->end(End::BetweenMessages); });
-  finishTurn();
+  endWithoutMemory([&] {
+    _output += authentication->opening();
+    _authentication = std::move(authentication);
+    _authenticationTimer =
+        _queue->makeTimer(kAuthenticationTime, kAuthenticationTime,
+                          [self = shared_from_this()] { self->end(End::BetweenMessages); });
+    sendAndWatch();
+  });
 }
 
 void DBusConnection::end(End end) {
@@ -99,7 +115,9 @@ void DBusConnection::endAfterInput() {
   if (!_isStarted) return end(End::BetweenMessages);
   if (!isOpen() || _endTimer) return;
   ::shutdown(_socket.get(), SHUT_RD);
-  _endTimer = _queue->makeTimer(kPatienceAtEnd, kPatienceAtEnd, turn(&DBusConnection::endUnlessReading));
+  endWithoutMemory([this] {
+    _endTimer = _queue->makeTimer(kPatienceAtEnd, kPatienceAtEnd, turn(&DBusConnection::endUnlessReading));
+  });
 }
 
 std::uint32_t DBusConnection::nextSerial() {
@@ -112,16 +130,29 @@ std::optional<std::string> DBusConnection::write(dbus::MessageFields fields, con
   if (!isOpen() || _peerHasGone) return std::nullopt;
   fields.descriptors = static_cast<std::uint32_t>(descriptors.size());
   const std::size_t start = _output.size();
-  dbus::MessageBuilder message(_output, fields);
-  const auto problem = dbus::writeBody(message.body(), fields.signature, values, descriptors.size());
-  if (problem) {
+  try {
+    if (auto problem = append(fields, values, std::move(descriptors))) {
+      _output.resize(start);
+      return problem;
+    }
+  } catch (const std::bad_alloc&) {
     _output.resize(start);
-    return problem;
+    throw;
   }
-  message.finish();
   ++_queuedMessages;
-  if (!descriptors.empty()) _attachments.push_back({start, std::move(descriptors)});
   if (!_isTakingTurn) finishTurn();
+  return std::nullopt;
+}
+
+std::optional<std::string> DBusConnection::append(const dbus::MessageFields& fields,
+                                                  const std::vector<Value>& values,
+                                                  std::vector<FileDescriptor> descriptors) {
+  const std::size_t start = _output.size();
+  dbus::MessageBuilder message(_output, fields);
+  auto problem = dbus::writeBody(message.body(), fields.signature, values, descriptors.size());
+  if (problem) return problem;
+  message.finish();
+  if (!descriptors.empty()) _attachments.push_back({start, std::move(descriptors)});
   return std::nullopt;
 }
 
@@ -139,8 +170,20 @@ bool DBusConnection::isClogged() const {
          (_queuedMessages > kMaximumQueuedMessages || _output.size() - _sentBytes > kMaximumQueuedBytes);
 }
 
+/// A message that is too large for what memory is left, or whatever else finds none in a turn, costs this
+/// connection, and nobody else.
+template <class Part>
+void DBusConnection::endWithoutMemory(const Part& part) {
+  try {
+    part();
+  } catch (const std::bad_alloc&) {
+    _isTakingTurn = false;
+    end(End::WithinMessage);
+  }
+}
+
 Work DBusConnection::turn(void (DBusConnection::*part)()) {
-  return [self = shared_from_this(), part] { (self.get()->*part)(); };
+  return [self = shared_from_this(), part] { self->endWithoutMemory([&] { (self.get()->*part)(); }); };
 }
 
 void DBusConnection::readable() {
@@ -162,6 +205,10 @@ void DBusConnection::writable() {
 }
 
 void DBusConnection::finishTurn() {
+  endWithoutMemory([this] { sendAndWatch(); });
+}
+
+void DBusConnection::sendAndWatch() {
   _isTakingTurn = true;
   flush();
   while (isOpen() && !hasOutput() && drained()) flush();
@@ -182,10 +229,10 @@ DBusConnection::Received DBusConnection::receive(std::string_view& bytes) {
   const ssize_t length = ::recvmsg(_socket.get(), &message, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
   if (length < 0) return errno == EAGAIN || errno == EINTR ? Received::Nothing : Received::EndOfStream;
   if (length == 0) return Received::EndOfStream;
-  if (message.msg_controllen > 0) collectDescriptors(message, _descriptors);
+  const bool keptAll = message.msg_controllen == 0 || collectDescriptors(message, _descriptors);
   bytes = {readBuffer(), static_cast<std::size_t>(length)};
   const bool isCut = (message.msg_flags & MSG_CTRUNC) != 0;  // No room for them in this process.
-  if (!isCut && _descriptors.size() <= kMaximumDescriptors) return Received::Bytes;
+  if (keptAll && !isCut && _descriptors.size() <= kMaximumDescriptors) return Received::Bytes;
   end(End::WithinMessage);
   return Received::Nothing;
 }
@@ -201,9 +248,6 @@ void DBusConnection::take(std::string_view fresh) {
       if (_input.empty()) _input = {};  // An idle connection keeps no room.
     }
   } catch (const dbus::Malformed&) {
-    end(End::WithinMessage);
-  } catch (const std::bad_alloc&) {
-    // A message that is too large for what memory is left costs its sender the connection, and nobody else.
     end(End::WithinMessage);
   }
 }

@@ -29,6 +29,8 @@ struct MessageFields;
 /// no more. The sources keep the object until the connection ends. Bounds: when more than
 /// kMaximumQueuedMessages or kMaximumQueuedBytes wait for a peer that does not read, nothing more is read
 /// from it; at most kMaximumDescriptors wait for their messages; authentication may last kAuthenticationTime.
+/// A connection that finds no memory for what it reads or waits for ends.
+///
 /// Threading: everything on the queue, unless stated otherwise.
 class DBusConnection : public std::enable_shared_from_this<DBusConnection> {
  public:
@@ -62,9 +64,9 @@ class DBusConnection : public std::enable_shared_from_this<DBusConnection> {
   /// A serial number that no other message of this side has.
   [[nodiscard]] std::uint32_t nextSerial();
   /// Sends a message whose body is one value for each type of the signature, with the descriptors (the fields
-  /// need not count them); at once, or with what else the
-  /// present turn sends. Does nothing when nobody will read it.
-  /// @return why it cannot be written; nothing is sent then.
+  /// need not count them); at once, or with what else the present turn sends. Does nothing when nobody will
+  /// read it.
+  /// @return why it cannot be written; nothing is sent then, and neither when it throws std::bad_alloc.
   std::optional<std::string> write(dbus::MessageFields fields, const std::vector<Value>& values,
                                    std::vector<FileDescriptor> descriptors = {});
 
@@ -97,10 +99,15 @@ class DBusConnection : public std::enable_shared_from_this<DBusConnection> {
   };
   enum class Received { Bytes, Nothing, EndOfStream };
 
+  template <class Part>
+  void endWithoutMemory(const Part& part);
   [[nodiscard]] Work turn(void (DBusConnection::*part)());
   void readable();
   void writable();
   void finishTurn();
+  void sendAndWatch();
+  std::optional<std::string> append(const dbus::MessageFields& fields, const std::vector<Value>& values,
+                                    std::vector<FileDescriptor> descriptors);
   Received receive(std::string_view& bytes);
   void take(std::string_view fresh);
   std::size_t takeWhole(std::string_view bytes);
@@ -118,7 +125,7 @@ class DBusConnection : public std::enable_shared_from_this<DBusConnection> {
   std::unique_ptr<Source> _readSource;
   std::unique_ptr<Source> _writeSource;
   std::unique_ptr<Source> _authenticationTimer;
-  std::unique_ptr<Source> _endTimer;  ///< From endAfterInput() on.
+  std::unique_ptr<Source> _endTimer;                      ///< From endAfterInput() on.
   std::unique_ptr<dbus::Authentication> _authentication;  ///< Until it is over.
   bool _isStarted = false;
   bool _hasEnded = false;

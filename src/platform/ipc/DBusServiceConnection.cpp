@@ -5,6 +5,7 @@
 #include <sys/socket.h>
 
 #include <cassert>
+#include <new>
 #include <utility>
 
 #include "platform/dbus/Authentication.h"
@@ -88,10 +89,17 @@ std::optional<uid_t> DBusServiceConnection::peerUser() const {
 }
 
 void DBusServiceConnection::resume() {
-  queue()->async([self = shared_from_this(), this] {
-    constexpr auto kNobody = static_cast<uid_t>(-1);
+  queue()->async([self = shared_from_this(), this] { startService(); });
+}
+
+/// Nobody else would tell the delegate of the end of a connection that never began.
+void DBusServiceConnection::startService() {
+  constexpr auto kNobody = static_cast<uid_t>(-1);
+  try {
     start(std::make_unique<dbus::ServerAuthentication>(peerUser().value_or(kNobody), serverIdentifier()));
-  });
+  } catch (const std::bad_alloc&) {
+    end(End::BetweenMessages);
+  }
 }
 
 void DBusServiceConnection::finish() {
@@ -148,7 +156,13 @@ void DBusServiceConnection::ended(End end) {
   const auto object = std::exchange(_object, nullptr);
   const auto interruptionHandler = std::exchange(_interruptionHandler, nullptr);
   const auto invalidationHandler = std::exchange(_invalidationHandler, nullptr);
-  if (end == End::WithinMessage && interruptionHandler) interruptionHandler();
+  if (end == End::WithinMessage && interruptionHandler) {
+    try {
+      interruptionHandler();
+    } catch (const std::bad_alloc&) {
+      // The end itself must be heard of.
+    }
+  }
   if (invalidationHandler) invalidationHandler();
 }
 

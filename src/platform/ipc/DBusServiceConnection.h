@@ -40,6 +40,7 @@ class DBusServiceConnection final : public ServiceConnection, public DBusConnect
  private:
   class Call;
 
+  void startService();
   void incoming(const dbus::Message& message, std::vector<FileDescriptor> descriptors) override;
   void ended(End end) override;
 
