@@ -28,6 +28,9 @@ struct HTTPRequest {
   /// For the whole request; zero: none, but 60 s without progress end it.
   std::chrono::milliseconds timeout{0};
   CachePolicy cachePolicy = CachePolicy::UseProtocol;
+  /// Asked on the request's queue before each further attempt of one that failed, if it is to have any; once
+  /// it says no there is none, and the request fails as HTTPFailure::Withdrawn. Unset: yes.
+  std::function<bool()> mayBeSentAgain{};
 };
 
 struct HTTPResponse {
@@ -44,6 +47,7 @@ enum class HTTPFailure {
   Transfer,      ///< The request, or the way to its response, failed.
   Permanent,     ///< The request or what it leads to is at fault: the same request would fail again.
   TooMuchWaits,  ///< Nothing was tried: unfinished requests hold as much as they may.
+  Withdrawn,     ///< It failed, and was not to be sent again.
 };
 
 /// What became of a request: an error, or a response and its body, which may be empty.

@@ -11,4 +11,9 @@ bool DiagnosticLogSubmissionEnabled(const platform::Platform& platform) {
   return enabled && enabled->booleanValue();
 }
 
+bool ConsentWatch::isWithdrawn() {
+  if (!_isWithdrawn && !DiagnosticLogSubmissionEnabled(_platform)) _isWithdrawn = true;
+  return _isWithdrawn;
+}
+
 }  // namespace tallyd

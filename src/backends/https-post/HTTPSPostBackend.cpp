@@ -22,6 +22,7 @@
 namespace tallyd {
 
 using platform::asl_log;
+using platform::HTTPFailure;
 using platform::LogLevel;
 using platform::Value;
 
@@ -35,15 +36,33 @@ bool isTimeSetAutomatically(const platform::Platform& platform) {
   return !automatic || automatic->booleanValue();
 }
 
-/// On the completion queue, after the backend may have gone: knows log and books only.
-void logPostError(platform::Log& log, const platform::HTTPResult& result) {
-  if (result.error) asl_log(log, LogLevel::Error, "Tally(sendMessage) post error: {}", *result.error);
+void logWithdrawal(platform::Log& log, std::size_t events) {
+  asl_log(log, LogLevel::Info, "Tally(HTTPSPostBackend): consent has been withdrawn, not posting {} events",
+          events);
+}
+
+// On the completion queue, after the backend may have gone: these know log and books only.
+
+void logPostError(platform::Log& log, std::size_t events, const platform::HTTPResult& result) {
+  if (!result.error) return;
+  if (result.failure == HTTPFailure::Withdrawn) return logWithdrawal(log, events);
+  asl_log(log, LogLevel::Error, "Tally(sendMessage) post error: {}", *result.error);
+}
+
+DropReason dropReasonOf(HTTPFailure failure) {
+  switch (failure) {
+    case HTTPFailure::TooMuchWaits:
+      return DropReason::MemoryBound;
+    case HTTPFailure::Withdrawn:
+      return DropReason::ConsentWithdrawn;
+    default:
+      return DropReason::PostFailed;
+  }
 }
 
 void bookPost(Account& account, std::size_t events, const platform::HTTPResult& result) {
   if (!result.error) return account.finish(events, answerOf(result));
-  const bool outOfMemory = result.failure == platform::HTTPFailure::TooMuchWaits;
-  account.drop(outOfMemory ? DropReason::MemoryBound : DropReason::PostFailed, events);
+  account.drop(dropReasonOf(result.failure), events);
 }
 
 }  // namespace
@@ -97,13 +116,13 @@ TallyBackend::Result HTTPSPostBackend::sendMessage(const Payload& payload, const
     return std::nullopt;
   }
   if (isConsentWithdrawn()) {
-    logWithdrawal(1);
+    logWithdrawal(_platform.log, 1);
     _account->dropNew(DropReason::ConsentWithdrawn, 1, numbers);
     return std::nullopt;
   }
-  _account->start();
   Events events;
   events.push_back(std::move(event));
+  _account->start();
   const auto document = documentOf(events);
   return document ? postJsonMessage(*document) : std::nullopt;
 }
@@ -259,23 +278,15 @@ void HTTPSPostBackend::batchEvent(EventRecord event, const MessageNumbers& numbe
   ++count;
 }
 
-bool HTTPSPostBackend::isConsentWithdrawn() {
-  if (_consentChecks == ConsentChecks::BeforeEachPost && _dnuEnabled && !_isConsentWithdrawn) {
-    _isConsentWithdrawn = !DiagnosticLogSubmissionEnabled(_platform);
-  }
-  return _isConsentWithdrawn;
-}
-
-void HTTPSPostBackend::logWithdrawal(std::size_t events) const {
-  asl_log(_platform.log, LogLevel::Info,
-          "Tally(HTTPSPostBackend): consent has been withdrawn, not posting {} events", events);
+void HTTPSPostBackend::recheckConsent() {
+  if (_dnuEnabled) _consentWatch = std::make_shared<ConsentWatch>(_platform);
 }
 
 std::optional<HTTPSPostBackend::Document> HTTPSPostBackend::takeBatchForPost() {
   Events events = std::move(*_batchedEvents);
   _batchedEvents.reset();
   if (isConsentWithdrawn()) {
-    logWithdrawal(events.size());
+    logWithdrawal(_platform.log, events.size());
     _account->dropHeld(DropReason::ConsentWithdrawn, events.size());
     return std::nullopt;
   }
@@ -354,6 +365,7 @@ platform::HTTPRequest HTTPSPostBackend::requestFor(const std::string& json) cons
   request.body = platform::Data(plain ? json : std::move(*compressed));
   request.headers.emplace_back("Content-Length", std::to_string(request.body.size()));
   if (!plain) request.headers.emplace_back("Content-Encoding", "gzip");
+  if (_consentWatch) request.mayBeSentAgain = [watch = _consentWatch] { return !watch->isWithdrawn(); };
   return request;
 }
 
@@ -369,7 +381,7 @@ platform::HTTPClient::Completion HTTPSPostBackend::completionFor(const Document&
   });
   return [&log = _platform.log, account = _account, events = document.events,
           post](const platform::HTTPResult& result) {
-    logPostError(log, result);
+    logPostError(log, events, result);
     bookPost(*account, events, result);
     if (post == 0) return;
     account->show("post", [&](TapLine& line) {

@@ -27,9 +27,9 @@ namespace tallyd {
 /// A batch holds at most threshold + 1 events of one method. Posts go to the shared transfer engine and are
 /// not retried here; what becomes of them is only logged.
 ///
-/// Consent is read when the backend is made. With recheckConsent() it is read again before each post: when it
-/// was there at first and has gone, this and all later posts are dropped. It never makes anything leave that
-/// would not have left without it.
+/// Consent is read when the backend is made. With recheckConsent() it is read again before each post, and
+/// before each further attempt of one: when it was there at first and has gone, this and all later posts are
+/// dropped. It never makes anything leave that would not have left without it.
 ///
 /// Books: events. Those of a batch are held; those of a post are in flight until it is done, and then sent
 /// when there was a response, with whatever status. Threading: the session's queue; the posts' completions
@@ -46,7 +46,7 @@ class HTTPSPostBackend final : public TallyBackend {
   ~HTTPSPostBackend() override;
 
   [[nodiscard]] std::string_view kind() const override { return "https-post"; }
-  void recheckConsent() override { _consentChecks = ConsentChecks::BeforeEachPost; }
+  void recheckConsent() override;
   using TallyBackend::sendMessage;
   /// The posted document when the user consents to see it; nothing when nothing was posted.
   Result sendMessage(const Payload& payload, const timeval& timestamp, std::uint16_t method,
@@ -85,8 +85,7 @@ class HTTPSPostBackend final : public TallyBackend {
                                          std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID);
   void batchEvent(EventRecord event, const MessageNumbers& numbers);
   [[nodiscard]] bool hasRequiredUserInfo() const { return !_requireUserInfo || _userInfoDict; }
-  [[nodiscard]] bool isConsentWithdrawn();
-  void logWithdrawal(std::size_t events) const;
+  [[nodiscard]] bool isConsentWithdrawn() const { return _consentWatch && _consentWatch->isWithdrawn(); }
   /// Prepares and takes the batch away; what is left is no batch. Nothing without a document, and when
   /// consent is withdrawn.
   std::optional<Document> takeBatchForPost();
@@ -108,8 +107,7 @@ class HTTPSPostBackend final : public TallyBackend {
   EventRecords _records;
   EventFilters _filters;
   const bool _dnuEnabled;
-  ConsentChecks _consentChecks = ConsentChecks::AtStart;
-  bool _isConsentWithdrawn = false;  ///< Seen to be, once.
+  std::shared_ptr<ConsentWatch> _consentWatch;  ///< Null when consent is not looked at again.
   DNUType _dnuType = DNUTypeConsent;
   std::int32_t _eventThreshold = kDefaultEventThreshold;
   std::int32_t _extrasOnInternal = 0;

@@ -70,35 +70,35 @@ UploadBackend::UploadBackend(const platform::Platform& platform, std::string_vie
 
 bool UploadBackend::uploadFileAtPath(std::string_view path, std::string_view extensionToken) {
   asl_log(_platform.log, LogLevel::Debug, "Tally(uploadFileAtPath): Uploading file {}", path);
-  const auto notUploadable = [this] {
-    _account->drop(DropReason::NotUploadable);
-    return false;
-  };
   _account->start();
-  if (!_uploadURL) return notUploadable();
-  const std::string filePath(path);
+  try {
+    if (upload(std::string(path), extensionToken)) return true;
+  } catch (const std::bad_alloc&) {
+    asl_log(_platform.log, LogLevel::Error, "Tally(uploadFileAtPath): Out of memory for {}", path);
+  }
+  _account->drop(DropReason::NotUploadable);
+  return false;
+}
+
+bool UploadBackend::upload(const std::string& path, std::string_view extensionToken) const {
+  if (!_uploadURL) return false;
   const SandboxExtension extension(_platform.sandbox, extensionToken);
-  auto body = compressedFile(filePath);
-  if (!body) return notUploadable();
+  auto body = compressedFile(path);
+  if (!body) return false;
   const std::string url = uploadURLForFile(*_uploadURL, _udid ? _udid : "(null)", _sessionID, path);
   if (!hasURLCharactersOnly(url)) {
     asl_log(_platform.log, LogLevel::Error, "Tally(uploadFileAtPath): Unable to create URL request");
-    return notUploadable();
+    return false;
   }
-  post(filePath, url, std::move(*body));
+  post(path, url, std::move(*body));
   return true;
 }
 
 std::optional<std::string> UploadBackend::compressedFile(const std::string& path) const {
   // A large file keeps the thread for seconds.
   const auto blocking = _platform.queues.blockingCall();
-  try {
-    const auto contents = fileContents(path);
-    return contents ? gzipDeflate(*contents, _platform.log) : std::nullopt;
-  } catch (const std::bad_alloc&) {
-    asl_log(_platform.log, LogLevel::Error, "Tally(uploadFileAtPath): Out of memory for {}", path);
-    return std::nullopt;
-  }
+  const auto contents = fileContents(path);
+  return contents ? gzipDeflate(*contents, _platform.log) : std::nullopt;
 }
 
 std::optional<std::string> UploadBackend::fileContents(const std::string& path) const {
@@ -137,7 +137,7 @@ void UploadBackend::post(const std::string& path, const std::string& url, std::s
   }
   _account->drop(DropReason::UploadFailed);
   asl_log(_platform.log, LogLevel::Error, "Tally(uploadFileAtPath): post {}",
-          result.error.value_or("(null)"));
+          result.error ? std::string_view(*result.error) : "(null)");
 }
 
 void UploadBackend::takeAnswer(const std::string& path, std::string_view answer) const {

@@ -40,6 +40,8 @@ class UploadBackend final : public TallyBackend {
   UploadBackend(const platform::Platform& platform, std::string_view name, const Payload& profile,
                 const std::optional<std::string>& productFamily, std::string_view uploadURL);
 
+  /// True when it was sent, and is booked. Throws std::bad_alloc before that only.
+  bool upload(const std::string& path, std::string_view extensionToken) const;
   [[nodiscard]] std::optional<std::string> compressedFile(const std::string& path) const;
   [[nodiscard]] std::optional<std::string> fileContents(const std::string& path) const;
   void post(const std::string& path, const std::string& url, std::string body) const;

@@ -22,6 +22,10 @@ std::string reasonOf(const HTTPRequest& request, const HTTPResult& result) {
   return fmt::format("status {} ({})", result.response->status, urlForMessages(request.url));
 }
 
+bool mayBeSentAgain(const HTTPRequest& request) {
+  return !request.mayBeSentAgain || request.mayBeSentAgain();
+}
+
 /// The client below holds its own copy of all but the body, which is shared.
 std::size_t heldBytesWithCopy(const HTTPRequest& request) {
   return 2 * heldBytesOf(request) - request.body.size();
@@ -154,10 +158,17 @@ class RetryingHTTPClient::Posts : public std::enable_shared_from_this<Posts> {
 
   /// False when there can't be another attempt, and the post's last result says why it has failed.
   bool attemptAgain(const SharedPost& post) {
-    const std::lock_guard lock(_mutex);
-    if (_waiting.erase(post) == 0) return true;  // It has been told already.
-    if (_isClosed) return false;
+    {
+      const std::lock_guard lock(_mutex);
+      if (_waiting.erase(post) == 0) return true;  // It has been told already.
+    }
     try {
+      if (!mayBeSentAgain(post->request)) {
+        post->lastResult = failedRequest(post->request, "not to be sent again", HTTPFailure::Withdrawn);
+        return false;
+      }
+      const std::lock_guard lock(_mutex);
+      if (_isClosed) return false;
       attempt(post);
       return true;
     } catch (const std::bad_alloc&) {

@@ -15,8 +15,8 @@ class Log;
 class Randomness;
 
 /// Hands everything on to another client; an asynchronous request that fails is handed on again, as
-/// decideRetry() says, and its completion hears of the last attempt only. Synchronous requests are not
-/// repeated.
+/// decideRetry() says, unless it is not to be sent again any more, and its completion hears of the last
+/// attempt only. Synchronous requests are not repeated.
 ///
 /// A server may get twice what it had received when the transfer failed.
 ///

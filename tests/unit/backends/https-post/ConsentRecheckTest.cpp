@@ -87,6 +87,40 @@ TEST_F(ConsentRecheckTest, DropsTheBatchAtItsEnd) {
   EXPECT_TRUE(account->counts().isBalanced());
 }
 
+TEST_F(ConsentRecheckTest, AFailedPostIsSentAgainOnlyWhileTheUserConsents) {
+  auto backend = rechecking(evaluated());
+  (void)send(*backend);
+  backend.reset();
+  const auto request = fake.http.posts().at(0);
+  ASSERT_TRUE(request.mayBeSentAgain);
+  EXPECT_TRUE(request.mayBeSentAgain());
+  setConsent(false);
+  EXPECT_FALSE(request.mayBeSentAgain());
+  setConsent(true);
+  EXPECT_FALSE(request.mayBeSentAgain());
+}
+
+TEST_F(ConsentRecheckTest, WithoutTheRecheckNothingAsksBeforeAPostIsSentAgain) {
+  const auto backend = evaluated();
+  (void)send(*backend);
+  EXPECT_FALSE(fake.http.posts().at(0).mayBeSentAgain);
+}
+
+TEST_F(ConsentRecheckTest, BooksAPostThatWasNotSentAgainAsWithdrawnWithOneLine) {
+  const auto backend = rechecking(evaluated());
+  fake.http.answer = [](const auto&) {
+    auto result = fakes::FakeHTTPClient::failure("not to be sent again");
+    result.failure = platform::HTTPFailure::Withdrawn;
+    return result;
+  };
+  (void)send(*backend);
+  fake.queues.run();
+  EXPECT_EQ(withdrawn(), 1U);
+  EXPECT_EQ(linesAbout(1), 1U);
+  EXPECT_FALSE(fake.log.hasTextStartingWith(Level::Error, ""));
+  EXPECT_TRUE(account->counts().isBalanced());
+}
+
 TEST_F(ConsentRecheckTest, ConsentThatComesBackDoesNotStartTheSessionAgain) {
   const auto backend = rechecking(evaluated());
   setConsent(false);

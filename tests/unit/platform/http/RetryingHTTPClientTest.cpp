@@ -294,6 +294,43 @@ TEST_F(RetryingHTTPClientTest, AFurtherAttemptThatFindsNoMemoryIsTheLast) {
   EXPECT_EQ(attempts(), 2U);
 }
 
+TEST_F(RetryingHTTPClientTest, WhatIsNotToBeSentAgainIsAskedBeforeEachFurtherAttemptAndEndsAsWithdrawn) {
+  makeClient(3);
+  answers = {FakeHTTPClient::failure("refused")};
+  lastAnswerStays = true;
+  HTTPRequest request;
+  request.url = "https://collect.example/in";
+  int asked = 0;
+  request.mayBeSentAgain = [&asked] { return ++asked < 2; };
+  client->sendAsynchronousRequest(request, queue,
+                                  [this](const HTTPResult& result) { results.push_back(result); });
+  queues.run();
+  EXPECT_EQ(asked, 0);
+  queues.advance(15min);
+  EXPECT_EQ(asked, 2);
+  EXPECT_EQ(attempts(), 2U);
+  ASSERT_EQ(results.size(), 1U);
+  EXPECT_EQ(results[0].failure, HTTPFailure::Withdrawn);
+  EXPECT_EQ(results[0].error, "not to be sent again (https://collect.example/in)");
+}
+
+TEST_F(RetryingHTTPClientTest, WithoutMemoryToAskWhetherToSendAgainThereIsNoFurtherAttempt) {
+  makeClient(3);
+  answers = {FakeHTTPClient::failure("refused")};
+  HTTPRequest request;
+  request.url = "https://collect.example/in";
+  request.mayBeSentAgain = []() -> bool { throw std::bad_alloc(); };
+  client->sendAsynchronousRequest(request, queue,
+                                  [this](const HTTPResult& result) { results.push_back(result); });
+  queues.advance(15min);
+  EXPECT_EQ(attempts(), 1U);
+  ASSERT_EQ(results.size(), 1U);
+  EXPECT_EQ(results[0].error, "out of memory (https://collect.example/in)");
+  client.reset();
+  queues.run();
+  EXPECT_EQ(results.size(), 1U);
+}
+
 TEST_F(RetryingHTTPClientTest, WithoutMemoryForTheWaitThereIsNoFurtherAttempt) {
   makeClient(3);
   answers = {FakeHTTPClient::failure("refused")};
