@@ -1,5 +1,5 @@
 // Servers that close connections while nothing is under way, as all do after a while: no request may be lost
-// to that, and none may be sent twice that was received.
+// to that.
 
 #include <gmock/gmock.h>
 #include <sys/socket.h>
