@@ -13,7 +13,6 @@ namespace tallyd {
 using platform::asl_log;
 using platform::Dictionary;
 using platform::LogLevel;
-using platform::Value;
 
 namespace {
 

@@ -157,31 +157,41 @@ TallyBackend::Result DashboardBackend::sendMessage(const Payload& payload, const
 
 bool DashboardBackend::uploadLogData(const platform::Array& logData) {
   _account->start();
-  if (!_postURL) {
-    asl_log(_platform.log, LogLevel::Error, "Tally (DashboardBackend): Post URL for log data array is nil");
+  std::optional<platform::HTTPResult> result;
+  try {
+    result = postLogData(logData);
+  } catch (const std::bad_alloc&) {
+    asl_log(_platform.log, LogLevel::Error, "Tally (DashboardBackend): can't malloc.");
+    _account->drop(DropReason::OutOfMemory);
+    return false;
+  }
+  if (!result) {
     _account->drop(DropReason::NotUploadable);
     return false;
   }
-  auto archive = platform::archivedDataWithRootObject(logData);
-  if (!archive) {
-    asl_log(_platform.log, LogLevel::Error,
-            "Tally (DashboardBackend): Failed to serialize log data array for upload");
-    _account->drop(DropReason::NotUploadable);
-    return false;
-  }
-  const platform::HTTPResult result = postLogData(platform::Data(std::move(*archive)));
-  if (result.error || !result.response) {
+  if (result->error || !result->response) {
     asl_log(_platform.log, LogLevel::Error, "Tally (DashboardBackend): Error uploading log data array ({})",
-            result.error.value_or("(null)"));
+            result->error ? std::string_view(*result->error) : "(null)");
     _account->drop(DropReason::UploadFailed);
     return false;
   }
-  _account->finish(1, answerOf(result));
-  reportUpload(platform::withBrokenUTF8Replaced(result.data.bytes()));
+  _account->finish(1, answerOf(*result));
+  reportUpload(platform::withBrokenUTF8Replaced(result->data.bytes()));
   return true;
 }
 
-platform::HTTPResult DashboardBackend::postLogData(platform::Data archive) const {
+std::optional<platform::HTTPResult> DashboardBackend::postLogData(const platform::Array& logData) const {
+  if (!_postURL) {
+    asl_log(_platform.log, LogLevel::Error, "Tally (DashboardBackend): Post URL for log data array is nil");
+    return std::nullopt;
+  }
+  auto serialized = platform::archivedDataWithRootObject(logData);
+  if (!serialized) {
+    asl_log(_platform.log, LogLevel::Error,
+            "Tally (DashboardBackend): Failed to serialize log data array for upload");
+    return std::nullopt;
+  }
+  platform::Data archive(std::move(*serialized));
   const std::uint64_t bytes = archive.size();
   platform::HTTPResult result =
       _platform.http.sendSynchronousRequest({.url = *_postURL,

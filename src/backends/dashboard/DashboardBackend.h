@@ -64,7 +64,9 @@ class DashboardBackend final : public TallyBackend {
 
   [[nodiscard]] bool startWithProfile();
   [[nodiscard]] bool startWithServer(const std::optional<std::string>& serverIP, std::uint16_t serverPort);
-  [[nodiscard]] platform::HTTPResult postLogData(platform::Data archive) const;
+  /// Nothing, after a line in the log, when there is nothing to send or nowhere. Throws std::bad_alloc before
+  /// anything was sent only.
+  [[nodiscard]] std::optional<platform::HTTPResult> postLogData(const platform::Array& logData) const;
   void reportUpload(std::string_view location);
 
   const std::shared_ptr<DatagramSender> _sender;

@@ -2,7 +2,9 @@
 
 #include <gtest/gtest.h>
 
+#include <new>
 #include <random>
+#include <thread>
 
 #include "DashboardFixture.h"
 #include "backends/dashboard/DatagramSender.h"
@@ -176,6 +178,29 @@ TEST_F(DashboardBooksTest, LogDataIsBookedAsItsAnswerComes) {
   EXPECT_FALSE(without->uploadLogData(Array{"a"}));
   EXPECT_EQ(counts().droppedFor(DropReason::NotUploadable), 1U);
   expectBalance();
+}
+
+TEST_F(DashboardBooksTest, LogDataIsSentOrDroppedWhicheverAllocationFails) {
+  const auto backend = booked(profile({{"post_url", "https://logs.example/"}}));
+  const Array logData{"a", Dictionary{{"b", 1}}};
+  int number = 0;
+  bool sent = false;
+  for (bool failed = true; failed;) {
+    {
+      const test::OneFailingAllocation failing(std::this_thread::get_id(), ++number);
+      try {
+        sent = backend->uploadLogData(logData);
+      } catch (const std::bad_alloc&) {
+        sent = false;  // The answer could not be told.
+      }
+      failed = failing.hasFailed();
+    }
+    fake.queues.run();
+    EXPECT_EQ(counts().held + counts().inFlight, 0U) << "allocation " << number;
+    expectBalance();
+  }
+  EXPECT_TRUE(sent);
+  EXPECT_GT(counts().droppedFor(DropReason::OutOfMemory), 5U);
 }
 
 TEST_F(DashboardBooksTest, FilesPassItBy) {
