@@ -1,5 +1,6 @@
 #include "load/LoadBench.h"
 
+#include <fmt/format.h>
 #include <sys/resource.h>
 #include <zlib.h>
 
@@ -130,30 +131,35 @@ void CountingCollector::serve(RawConnection& connection) {
 
 // What is asked and what came of it
 
-Crowd Crowd::withinLimits() {
+void takeDescriptorsFor(const Crowd& crowd) {
+  constexpr std::size_t kForOtherThings = 200;
+  const rlim_t needed = crowd.connections + kForOtherThings;
   rlimit limit{};
   if (::getrlimit(RLIMIT_NOFILE, &limit) != 0) throw std::runtime_error("getrlimit");
+  limit.rlim_max = std::max(limit.rlim_max, needed);  // Root may raise it.
   limit.rlim_cur = limit.rlim_max;
-  ::setrlimit(RLIMIT_NOFILE, &limit);
-  constexpr std::size_t kForOtherThings = 200;
-  Crowd crowd;
-  const auto most = static_cast<std::size_t>(limit.rlim_max) - kForOtherThings;
-  if (most < crowd.connections) crowd = {.connections = most, .active = most / 10};
-  return crowd;
+  if (::setrlimit(RLIMIT_NOFILE, &limit) == 0) return;
+  ::getrlimit(RLIMIT_NOFILE, &limit);
+  throw std::runtime_error(fmt::format(
+      "{} connections need a hard limit of {} open files (ulimit -n {}, as root or where the limit is set); "
+      "it is {}",
+      crowd.connections, needed, needed, limit.rlim_max));
 }
 
-double LoadResult::tenthBytes(std::size_t tenth) const {
-  const std::size_t begin = samples.size() * tenth / 10;
-  const std::size_t end = std::max(samples.size() * (tenth + 1) / 10, begin + 1);
-  double sum = 0;
-  for (std::size_t i = begin; i < end; ++i) sum += static_cast<double>(samples.at(i).residentBytes);
-  return sum / static_cast<double>(end - begin);
+std::size_t LoadResult::medianBytes(std::size_t fromTenth, std::size_t toTenth) const {
+  const std::size_t end = std::max<std::size_t>(samples.size() * toTenth / 10, 1);
+  std::vector<std::size_t> bytes;
+  for (std::size_t i = samples.size() * fromTenth / 10; i < end; ++i)
+    bytes.push_back(samples.at(i).residentBytes);
+  const auto median = bytes.begin() + static_cast<std::ptrdiff_t>(bytes.size() / 2);
+  std::nth_element(bytes.begin(), median, bytes.end());
+  return *median;
 }
 
 bool LoadResult::hasFlatMemory() const {
-  constexpr double kShare = 0.1;
-  constexpr double kBytes = 4.0 * 1024 * 1024;
-  return lastTenthBytes() <= secondTenthBytes() * (1 + kShare) + kBytes;
+  constexpr double kShare = 0.03;
+  constexpr double kBytes = 1024 * 1024;
+  return static_cast<double>(lateBytes()) <= static_cast<double>(earlyBytes()) * (1 + kShare) + kBytes;
 }
 
 bool LoadResult::leavesNothing() const {
@@ -183,6 +189,7 @@ void LoadBench::runFirstSession() {
 }
 
 LoadResult LoadBench::run(const Crowd& crowd) {
+  takeDescriptorsFor(crowd);
   LoadResult result;
   result.name = "crowd";
   result.connections = crowd.connections;

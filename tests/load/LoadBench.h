@@ -35,10 +35,13 @@ struct Crowd {
   /// In each, every active client sends a message and waits for the answer; it ends when all are posted.
   std::size_t rounds = 20;
   std::chrono::seconds atLeast{0};  ///< Rounds go on for this long.
-
-  /// As large as the limit of descriptors of this process and of the daemon's allows.
-  [[nodiscard]] static Crowd withinLimits();
 };
+
+/// Lets this process have as many descriptors as it may, for the crowd's connections and some more; a daemon
+/// may have as many.
+///
+/// Throws std::runtime_error, which says what limit is needed, when that is too few.
+void takeDescriptorsFor(const Crowd& crowd);
 
 /// The messages of a busy device's day: in each hour, `postingSessions` clients come, send
 /// `eventsOfAPostingSession` events that are posted one by one, and leave; `batchingSessions` clients send
@@ -70,16 +73,19 @@ struct LoadResult {
   std::uint64_t arrived = 0;  ///< At the collector.
   bool balanced = true;       ///< In every look at the books.
 
-  /// Means over the second and the last tenth of the samples.
-  [[nodiscard]] double secondTenthBytes() const { return tenthBytes(1); }
-  [[nodiscard]] double lastTenthBytes() const { return tenthBytes(9); }
-  /// What the last tenth takes beyond the second is within what the allocator's own habits need.
+  /// Medians of the samples' second and third tenth, and of their last two: what is lost for good shows in
+  /// them, and what a moment needs does not.
+  [[nodiscard]] std::size_t earlyBytes() const { return medianBytes(1, 3); }
+  [[nodiscard]] std::size_t lateBytes() const { return medianBytes(8, 10); }
+  /// What is held late beyond what was held early is within what the allocator's own habits need: 3 % and a
+  /// mebibyte.
   [[nodiscard]] bool hasFlatMemory() const;
   /// As few threads and descriptors as before, but for the collector's idle connections and the inspection's.
   [[nodiscard]] bool leavesNothing() const;
 
  private:
-  [[nodiscard]] double tenthBytes(std::size_t tenth) const;
+  /// Of the samples from one tenth up to another one, which is left out.
+  [[nodiscard]] std::size_t medianBytes(std::size_t fromTenth, std::size_t toTenth) const;
 };
 
 /// A daemon with its servers. One run each.
@@ -87,6 +93,7 @@ class LoadBench {
  public:
   LoadBench();
 
+  /// Throws what takeDescriptorsFor() does.
   [[nodiscard]] LoadResult run(const Crowd& crowd);
   [[nodiscard]] LoadResult run(const Days& days);
 
