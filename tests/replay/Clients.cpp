@@ -18,9 +18,16 @@ Value optional(const OptionalDictionary& dictionary) {
 
 }  // namespace
 
+/// Ends when the client hears of it, as a real one does, and not within the daemon's call.
+class Clients::Connection : public fakes::FakeServiceConnection {
+ public:
+  using FakeServiceConnection::FakeServiceConnection;
+  void finish() override { ++finished; }
+};
+
 void Clients::connect(int client) {
   auto& connection = _connections[client];
-  connection = std::make_shared<fakes::FakeServiceConnection>(fmt::format("client {} of user 0", client));
+  connection = std::make_shared<Connection>(fmt::format("client {} of user 0", client));
   _agent.shouldAcceptNewConnection(connection);
   ++_connected;
 }
@@ -31,6 +38,7 @@ void Clients::disconnect(int client, Ending ending) {
   _world.surroundings().trace.write("client", "{} disconnects", client);
   if (ending == Ending::Broken) found->second->interrupt();
   found->second->invalidate();
+  _model.end(client);
   _connections.erase(found);
   _world.surroundings().isSessionEnding = true;
   _world.settle();
@@ -41,12 +49,21 @@ void Clients::disconnectAll() {
   while (!_connections.empty()) disconnect(_connections.begin()->first, Ending::Clean);
 }
 
+void Clients::disconnectEnded() {
+  std::vector<int> ended;
+  for (const auto& [client, connection] : _connections) {
+    if (connection->finished > 0) ended.push_back(client);
+  }
+  for (const int client : ended) disconnect(client, Ending::Clean);
+}
+
 std::shared_ptr<fakes::FakeIncomingCall> Clients::call(const Step& step, std::string_view method,
                                                        Arguments arguments, Answers answers) {
   using Answer = fakes::FakeServiceConnection::Answer;
   Surroundings& world = _world.surroundings();
   world.trace.write("call", "{} {}", step.client, method);
   ++_calls;
+  world.samplingFactor = world.draws.unit();
   const auto made =
       _connections.at(step.client)
           ->call(method, std::move(arguments), step.wantsAnswer ? Answer::Wanted : Answer::NotWanted);
@@ -63,16 +80,22 @@ std::shared_ptr<fakes::FakeIncomingCall> Clients::call(const Step& step, std::st
 
 void Clients::make(const Step& step, const Configure& configure) {
   call(step, "SetSessionInfo", {Array{configure.sessionInfo}, optional(configure.userInfo), Array()});
+  _model.configure(step.client, configure);
 }
-void Clients::make(const Step& step, const Start&) { call(step, "StartConfig", {}); }
+void Clients::make(const Step& step, const Start&) {
+  call(step, "StartConfig", {});
+  _model.start(step.client);
+}
 void Clients::make(const Step& step, const FetchStates& fetch) {
   call(step, "FetchStates", {optional(fetch.userInfo)});
+  _model.fetchStates(step.client, fetch);
 }
 void Clients::make(const Step& step, const FetchDisplayURL&) { call(step, "FetchDisplayURL", {}); }
 void Clients::make(const Step& step, const Send& send) {
   ++_world.surroundings().received.messagesOffered;
   call(step, "SendMessageWithCategory",
        {unsigned{send.category}, unsigned{send.type}, optional(send.payload)});
+  _model.send(step.client, send.category);
 }
 void Clients::make(const Step& step, const SendOnce& once) {
   ++_world.surroundings().received.messagesOffered;
@@ -83,8 +106,12 @@ void Clients::make(const Step& step, const SendOnce& once) {
         unsigned{once.message.type}, optional(once.message.payload)},
        isIdentified ? Answers::One : Answers::MayBeMissing);
   _world.surroundings().isOneShotCall = false;
+  _model.sendOnce(step.client, once);
 }
-void Clients::make(const Step& step, const Flush&) { call(step, "FlushMessages", {}); }
+void Clients::make(const Step& step, const Flush&) {
+  call(step, "FlushMessages", {});
+  _model.flush(step.client);
+}
 
 void Clients::make(const Step& step, const UploadFile& upload) {
   const auto path = _world.makeFile(upload);

@@ -5,6 +5,7 @@
 #include <string>
 
 #include "platform/Value.h"
+#include "replay/PostModel.h"
 #include "replay/Surroundings.h"
 
 namespace tallyd {
@@ -16,8 +17,9 @@ namespace tallyd::replay {
 /// Compares the daemon's books with themselves and with what the world received.
 class Invariants {
  public:
-  /// Borrows both.
-  Invariants(Ledger& ledger, Surroundings& world) : _ledger(ledger), _world(world) {}
+  /// Borrows them all.
+  Invariants(Ledger& ledger, Surroundings& world, const PostModel& model)
+      : _ledger(ledger), _world(world), _model(model) {}
 
   /// After a step, between a client's calls or while one waits. Does nothing when nothing was traced since
   /// the last look.
@@ -51,14 +53,17 @@ class Invariants {
   void checkOffers(const platform::Dictionary& total);
   void checkSession(const platform::Dictionary& session);
   void checkPosts(const Row& posts);
+  void checkForecast(const Row& posts);
   void checkUploads(const Row& uploads);
   void checkDashboards(const Row& dashboards);
   void checkOnDevice(const platform::Dictionary& snapshot);
   void equal(std::string_view what, std::uint64_t booked, std::uint64_t seen);
+  void within(std::string_view what, std::uint64_t booked, std::uint64_t seen, std::uint64_t uncertain);
   void atMost(std::string_view what, std::uint64_t number, std::uint64_t most);
 
   Ledger& _ledger;
   Surroundings& _world;
+  const PostModel& _model;
   std::size_t _linesChecked = 0;
 };
 

@@ -17,16 +17,21 @@ struct Received {
   std::uint64_t messagesOffered = 0;
   std::uint64_t uploadsOffered = 0;  ///< Files and log data.
   // Events in posts, by what became of the post.
-  std::uint64_t posts = 0;
+  std::uint64_t posts = 0;            ///< Handed over; their further attempts are no posts of their own.
+  std::uint64_t furtherAttempts = 0;  ///< Of posts that failed.
+  std::uint64_t eventsSaved = 0;      ///< Of those taken: by a further attempt.
+  std::uint64_t postsUnderWay = 0;    ///< Some have no events.
   std::uint64_t eventsUnderWay = 0;
   std::uint64_t eventsTaken = 0;
   std::uint64_t eventsRefused = 0;
   std::uint64_t eventsFailed = 0;
   std::uint64_t eventsWithoutRoom = 0;
+  std::uint64_t eventsUncertain = 0;  ///< Whether their post was given up or stopped is not known outside.
   // Requests that a session waits for.
   std::uint64_t fetches = 0;
   std::uint64_t fetchesFailed = 0;
-  std::uint64_t uploads = 0;  ///< Answered, with whatever status; so below.
+  std::uint64_t fatalAnswers = 0;  ///< Of those: they end a daemon that is not resilient.
+  std::uint64_t uploads = 0;       ///< Answered, with whatever status; so below.
   std::uint64_t uploadsRefused = 0;
   std::uint64_t uploadsFailed = 0;
   std::uint64_t logData = 0;
@@ -36,8 +41,10 @@ struct Received {
   std::uint64_t plainDatagrams = 0;     ///< Sent once and forgotten.
   std::uint64_t reliableDatagrams = 0;  ///< Each counted once.
   std::uint64_t retransmissions = 0;
-  std::uint64_t acknowledged = 0;        ///< Whose first acknowledgement the daemon read.
-  std::uint64_t surelyAcknowledged = 0;  ///< Of those: while the datagram can't have been given up.
+  std::uint64_t pushedOut = 0;            ///< Of a full queue, by newer ones.
+  std::uint64_t acknowledged = 0;         ///< Whose first acknowledgement the daemon read.
+  std::uint64_t surelyAcknowledged = 0;   ///< Of those: in time.
+  std::uint64_t perhapsAcknowledged = 0;  ///< Of those: at the instant at which the datagram is given up.
   std::uint64_t openSockets = 0;
   // What never leaves the device.
   std::uint64_t powerRecords = 0;

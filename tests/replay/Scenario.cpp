@@ -1,5 +1,7 @@
 #include "replay/Scenario.h"
 
+#include <fmt/format.h>
+
 #include <algorithm>
 #include <array>
 
@@ -21,6 +23,9 @@ constexpr int kSessionsPerHour = 9;
 constexpr double kBurstShare = 0.12;
 constexpr int kFirstClientType = 5;
 constexpr int kLastClientType = 11;
+/// No storebag has a name for them: each ends a daemon that is not resilient.
+constexpr std::array kStrangeClientTypes{-3, 0, 4, 12, 1'000'000};
+constexpr double kStrangerShare = 0.05;
 
 const std::array<const char*, 4> kClientNames{"Studio", "STUDIO", "atelier", "Workshop"};
 const std::array<const char*, 3> kServiceNames{"Calls", "calls", "Video"};
@@ -30,7 +35,10 @@ const std::array<const char*, 5> kTexts{"", "one", "two words", "caf\xC3\xA9 = \
 /// Writes the steps of a day, one client after the other.
 class DayWriter {
  public:
-  DayWriter(std::uint64_t seed, Milliseconds length) : _draws(seed), _length(length) {}
+  DayWriter(std::uint64_t seed, Milliseconds length, const OptIns& optIns)
+      : _draws(seed),
+        _length(length),
+        _hasStrangers(optIns.fatalFailures == platform::FatalFailures::FailRequest) {}
 
   std::vector<Step> write() {
     const auto sessions = std::chrono::duration_cast<hours>(_length).count() * kSessionsPerHour;
@@ -55,9 +63,13 @@ class DayWriter {
     if (!_draws.chance(0.05)) info.set(kTallyUserInfoServiceName, _draws.pick(kServiceNames));
     return info;
   }
+  std::int64_t clientType() {
+    if (_hasStrangers && _draws.chance(kStrangerShare)) return _draws.pick(kStrangeClientTypes);
+    return _draws.between(kFirstClientType, kLastClientType);
+  }
   Dictionary sessionInfo(bool requiresUserInfo) {
     return {{kTallySessionInfoSessionID.data(), _draws.between(1, 4'000'000'000)},
-            {kTallySessionInfoClientType.data(), _draws.between(kFirstClientType, kLastClientType)},
+            {kTallySessionInfoClientType.data(), clientType()},
             {kTallySessionInfoClientVersion.data(), _draws.between(0, 70'000)},
             {kTallySessionInfoRequireUserInfo.data(), requiresUserInfo},
             {kTallySessionInfoBatchEvent.data(), _draws.chance(0.5)}};
@@ -150,9 +162,9 @@ class DayWriter {
         add(at, make());
       }
     };
-    add(Milliseconds(0), SetPreference{"com.quillon.diagnostics", "DiagnosticLogSubmissionEnabled", true});
+    add(Milliseconds(0), SetPreference{"com.quillon.diagnostics", kConsentKey, true});
     around(hours(3), [this] {
-      return SetPreference{"com.quillon.diagnostics", "DiagnosticLogSubmissionEnabled", _draws.chance(0.6)};
+      return SetPreference{"com.quillon.diagnostics", kConsentKey, _draws.chance(0.6)};
     });
     around(hours(3), [this] {
       const bool isSet = _draws.chance(0.7);
@@ -172,6 +184,7 @@ class DayWriter {
 
   Draws _draws;
   const Milliseconds _length;
+  const bool _hasStrangers;
   std::vector<Step> _steps;
   int _client = 0;
   std::int64_t _serial = 0;
@@ -209,10 +222,28 @@ Happening fault(Draws& draws) {
   return Lose{draws.pick(kLosses)};
 }
 
+/// Any sixteen seeds in a row have all combinations.
+OptIns optInsOf(std::uint64_t seed) {
+  Draws draws(seed);
+  OptIns optIns;
+  if ((seed & 1U) != 0) optIns.retryPosts = static_cast<unsigned>(draws.between(1, 8));
+  if ((seed & 2U) != 0) optIns.consentChecks = ConsentChecks::BeforeEachPost;
+  if ((seed & 4U) != 0) optIns.fatalFailures = platform::FatalFailures::FailRequest;
+  // From what hardly suffices to what always does.
+  if ((seed & 8U) != 0) optIns.drain = draws.chance(0.5) ? seconds(draws.between(1, 20)) : kLongDrain;
+  return optIns;
+}
+
 }  // namespace
 
 Scenario makeScenario(std::uint64_t seed, hours length) {
-  return {seed, length, Draws(~seed).chance(0.3), DayWriter(seed, length).write()};
+  const OptIns optIns = optInsOf(seed);
+  return {.seed = seed,
+          .length = length,
+          .isInternalDevice = Draws(~seed).chance(0.3),
+          .steps = DayWriter(seed, length, optIns).write(),
+          .optIns = optIns,
+          .recipe = Recipe{.seed = seed, .length = length}};
 }
 
 Scenario withFaults(Scenario scenario, std::uint64_t seed) {
@@ -225,7 +256,26 @@ Scenario withFaults(Scenario scenario, std::uint64_t seed) {
     faulty.push_back(std::move(step));
   }
   scenario.steps = std::move(faulty);
+  if (scenario.recipe) scenario.recipe->faults = seed;
   return scenario;
+}
+
+Scenario scenarioOf(const Recipe& recipe) {
+  Scenario fine = makeScenario(recipe.seed, recipe.length);
+  return recipe.faults ? withFaults(std::move(fine), *recipe.faults) : fine;
+}
+
+bool mayStopFurtherAttempts(const OptIns& optIns) {
+  return optIns.retryPosts > 0 && optIns.consentChecks == ConsentChecks::BeforeEachPost;
+}
+
+std::string description(const OptIns& optIns) {
+  std::vector<std::string> parts;
+  if (optIns.retryPosts > 0) parts.push_back(fmt::format("retries {}", optIns.retryPosts));
+  if (optIns.consentChecks == ConsentChecks::BeforeEachPost) parts.emplace_back("consent re-read");
+  if (optIns.fatalFailures == platform::FatalFailures::FailRequest) parts.emplace_back("resilient");
+  if (optIns.drain) parts.push_back(fmt::format("drain {} s", optIns.drain->count()));
+  return parts.empty() ? "none" : fmt::format("{}", fmt::join(parts, ", "));
 }
 
 }  // namespace tallyd::replay

@@ -3,12 +3,12 @@
 #include <arpa/inet.h>
 #include <sys/eventfd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <deque>
 #include <map>
 #include <optional>
-#include <set>
 #include <string>
 
 #include "backends/dashboard/Datagram.h"
@@ -89,15 +89,14 @@ class SimulatedDatagrams::Socket : public platform::DatagramSocket {
   [[nodiscard]] bool send(std::string_view bytes) override {
     const std::uint16_t eventID = datagramNumber16(bytes, DatagramEventID);
     Datagram& datagram = _datagrams[eventID];
-    if (!datagram.acknowledged) _waiting.insert(eventID);
     if (!_closedBy && (_isOneShot || _world.isSessionEnding))
       _closedBy = _world.queues.now() + dashboardPeriod(_port) + kLastResort;
-    _wasFull = _wasFull || _waiting.size() > kMostWaiting;
     const bool taken = !_world.draws.chance(_world.weather.datagramIsNotTaken);
     _world.trace.write("datagram", "{}:{} event {} {}{}", _number, _port, eventID, taken ? "" : "not taken ",
                        bytes.substr(DatagramText));
-    if (!taken) return false;
     const bool reliable = (datagramNumber16(bytes, DatagramFlags) & DatagramFlagReliable) != 0;
+    keep(eventID, taken && !reliable);
+    if (!taken) return false;
     book(datagram, bytes, reliable);
     if (reliable && !_world.draws.chance(_world.weather.datagramIsLost)) acknowledge(eventID);
     return true;
@@ -119,6 +118,26 @@ class SimulatedDatagrams::Socket : public platform::DatagramSocket {
   };
 
   [[nodiscard]] bool fails() const { return _world.draws.chance(_world.weather.socketFails); }
+
+  /// What the daemon keeps after an attempt: at most so many, the oldest goes for one more.
+  void keep(std::uint16_t eventID, bool isDone) {
+    forgetGivenUp();
+    const auto kept = std::find(_waiting.begin(), _waiting.end(), eventID);
+    if (isDone && kept != _waiting.end()) _waiting.erase(kept);
+    if (isDone || kept != _waiting.end()) return;
+    _waiting.push_back(eventID);
+    if (_waiting.size() <= kMostWaiting) return;
+    ++_world.received.pushedOut;
+    _waiting.pop_front();
+  }
+  [[nodiscard]] bool isGivenUp(const Datagram& datagram) const {
+    return datagram.transmissions == kMostTransmissions &&
+           _world.queues.now() >= datagram.last + dashboardPeriod(_port);
+  }
+  /// A tick comes before whatever is sent at its instant.
+  void forgetGivenUp() {
+    std::erase_if(_waiting, [this](std::uint16_t eventID) { return isGivenUp(_datagrams[eventID]); });
+  }
 
   void book(Datagram& datagram, std::string_view bytes, bool reliable) {
     const milliseconds now = _world.queues.now();
@@ -164,9 +183,11 @@ class SimulatedDatagrams::Socket : public platform::DatagramSocket {
     if (found == _datagrams.end() || found->second.acknowledged) return;
     Datagram& datagram = found->second;
     datagram.acknowledged = true;
-    _waiting.erase(eventID);
     ++_world.received.acknowledged;
-    if (datagram.transmissions < kMostTransmissions && !_wasFull) ++_world.received.surelyAcknowledged;
+    const bool isKept = std::erase(_waiting, eventID) > 0;
+    if (isKept && !isGivenUp(datagram)) ++_world.received.surelyAcknowledged;
+    const bool isLastInstant = _world.queues.now() == datagram.last + dashboardPeriod(_port);
+    if (isKept && isGivenUp(datagram) && isLastInstant) ++_world.received.perhapsAcknowledged;
     _world.trace.write("socket", "{} event {} acknowledged", _number, eventID);
   }
 
@@ -177,8 +198,7 @@ class SimulatedDatagrams::Socket : public platform::DatagramSocket {
   const std::shared_ptr<Inbox> _inbox = std::make_shared<Inbox>();
   std::uint16_t _port = 0;
   std::map<std::uint16_t, Datagram> _datagrams;
-  std::set<std::uint16_t> _waiting;       ///< Given to the network, and not heard of again.
-  bool _wasFull = false;                  ///< More may have waited than the daemon keeps.
+  std::deque<std::uint16_t> _waiting;     ///< What the daemon must have kept, oldest first.
   std::optional<milliseconds> _closedBy;  ///< From the last message of a session on.
 };
 

@@ -38,11 +38,12 @@ class SimulatedDeviceProperties : public fakes::FakeDeviceProperties {
   Surroundings& _world;
 };
 
+/// Sampling factors are drawn call by call, so that the world knows them.
 class SimulatedRandomness : public platform::Randomness {
  public:
   explicit SimulatedRandomness(Surroundings& world) : _world(world) {}
 
-  double drand48() override { return _world.draws.unit(); }
+  double drand48() override { return _world.samplingFactor; }
   platform::UUIDBytes uuid() override {
     platform::UUIDBytes bytes{};
     for (auto& byte : bytes) byte = static_cast<std::uint8_t>(_world.draws.next());

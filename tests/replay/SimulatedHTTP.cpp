@@ -1,12 +1,9 @@
 #include "replay/SimulatedHTTP.h"
 
-#include <zlib.h>
-
 #include <array>
 
 #include "fakes/FakeHTTPClient.h"
 #include "fakes/SignedStorebag.h"
-#include "platform/JSON.h"
 #include "replay/Scenario.h"
 #include "replay/Storebags.h"
 
@@ -19,44 +16,23 @@ using platform::HTTPResult;
 namespace {
 
 constexpr std::chrono::seconds kWaitAfterFailure{900};
-constexpr int kMostPostBackends = 2;  // "splunk" and "https_post".
+constexpr const char* kRetryAfter = "Retry-After";
 
 HTTPResult answer(int status, std::string body,
                   std::vector<std::pair<std::string, std::string>> headers = {}) {
   return {std::nullopt, platform::HTTPResponse{status, std::move(headers)}, platform::Data(std::move(body))};
 }
 
-std::string header(const HTTPRequest& request, std::string_view name) {
-  for (const auto& [key, value] : request.headers) {
-    if (key == name) return value;
-  }
-  return {};
-}
-
-std::string gunzipped(std::string_view compressed) {
-  constexpr int kGzip = 15 + 16;  // zlib.h: the largest window, with a gzip header.
-  std::string plain(1 << 20, '\0');
-  z_stream stream{};
-  if (inflateInit2(&stream, kGzip) != Z_OK) return {};
-  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(compressed.data()));
-  stream.avail_in = static_cast<uInt>(compressed.size());
-  stream.next_out = reinterpret_cast<Bytef*>(plain.data());
-  stream.avail_out = static_cast<uInt>(plain.size());
-  inflate(&stream, Z_FINISH);
-  plain.resize(stream.total_out);
-  inflateEnd(&stream);
-  return plain;
-}
-
-std::string plainBody(const HTTPRequest& request) {
-  const std::string_view body = request.body.bytes();
-  return header(request, "Content-Encoding") == "gzip" ? gunzipped(body) : std::string(body);
-}
-
 /// "…/NAME?version=…".
 std::string storebagName(const std::string& url) {
   const auto slash = url.rfind('/');
   return url.substr(slash + 1, url.find('?') - slash - 1);
+}
+
+/// How long the server wants to be left alone: only these two statuses say so.
+std::chrono::seconds retryAfterOf(const HTTPResult& result) {
+  if (result.error || (result.response->status != 429 && result.response->status != 503)) return {};
+  return std::chrono::seconds(platform::leadingInteger(result.response->header(kRetryAfter).value_or("0")));
 }
 
 }  // namespace
@@ -68,11 +44,12 @@ HTTPResult SimulatedHTTP::sendSynchronousRequest(const HTTPRequest& request) {
 
 HTTPResult SimulatedHTTP::storebag(const std::string& url) {
   const std::string name = storebagName(url);
+  if (!isStorebagName(name)) _world.violated("a storebag was fetched that no client type has: " + name);
   checkFetch(name);
   ++_world.received.fetches;
   _world.elapse(_world.upTo(_world.weather.longestFetch));
   Attempt attempt{{}, _world.draws.chance(_world.weather.fetchFails), 0};
-  HTTPResult result = attempt.failed ? failedFetch() : envelope(name, attempt);
+  HTTPResult result = attempt.failed ? failedFetch(name) : envelope(name, attempt);
   attempt.ended = _world.clock.now();
   _attempts[name] = attempt;
   if (attempt.failed) ++_world.received.fetchesFailed;
@@ -102,11 +79,15 @@ HTTPResult SimulatedHTTP::envelope(const std::string& name, Attempt& attempt) {
   const auto& [cacheControl, seconds] = _world.draws.pick(kAges);
   attempt.maxAgeSeconds = seconds;
   HTTPResult result = answer(200, StorebagSigner::server().envelope(storebagNamed(name, _world.edition)));
+  _world.editionsTaken[name] = _world.edition;
   if (*cacheControl) result.response->headers.emplace_back("Cache-Control", cacheControl);
   return result;
 }
 
-HTTPResult SimulatedHTTP::failedFetch() {
+HTTPResult SimulatedHTTP::failedFetch(const std::string& name) {
+  constexpr double kFatalShare = 0.5;
+  const bool isResilient = _world.optIns.fatalFailures == platform::FatalFailures::FailRequest;
+  if (isResilient && _world.draws.chance(kFatalShare)) return fatalFetch(name);
   switch (_world.draws.between(0, 4)) {
     case 0:
       return answer(503, "<html>Busy</html>", {{"Cache-Control", "max-age=60"}});
@@ -119,6 +100,15 @@ HTTPResult SimulatedHTTP::failedFetch() {
     default:
       return fakes::FakeHTTPClient::failure("no way to the storebag server");
   }
+}
+
+HTTPResult SimulatedHTTP::fatalFetch(const std::string& name) {
+  ++_world.received.fatalAnswers;
+  const auto& server = StorebagSigner::server();
+  if (_world.draws.chance(0.5))
+    return answer(200, server.envelope(storebagWithoutVersion(name, _world.edition)));
+  return answer(200, server.envelope(storebagNamed(name, _world.edition)),
+                {{"Cache-Control", "private, max-age"}});
 }
 
 HTTPResult SimulatedHTTP::upload(const HTTPRequest& request) {
@@ -154,52 +144,41 @@ HTTPResult SimulatedHTTP::logData(const HTTPRequest& request) {
 
 void SimulatedHTTP::sendAsynchronousRequest(HTTPRequest request, std::shared_ptr<platform::SerialQueue> queue,
                                             Completion completion) {
-  const std::size_t events = takePost(request);
-  _world.received.eventsUnderWay += events;
-  queue->asyncAfter(_world.upTo(_world.weather.longestPost),
-                    [this, url = request.url, events, completion = std::move(completion)] {
-                      completion(postResult(url, events));
-                    });
+  _posts.attempt(request);
+  const auto duration = _world.upTo(_world.weather.longestPost);
+  queue->asyncAfter(duration, [this, request = std::move(request), completion = std::move(completion)] {
+    const HTTPResult result = postResult(request.url);
+    _posts.attempted(request, result, retryAfterOf(result));
+    completion(result);
+  });
 }
 
-std::size_t SimulatedHTTP::takePost(const HTTPRequest& request) {
-  ++_world.received.posts;
-  const std::string body = plainBody(request);
-  _world.trace.write("post", "{} {}", request.url, body);
-  const auto parsed = platform::valueFromJSON(body);
-  const auto* document = parsed.value ? parsed.value->dictionary() : nullptr;
-  if (!document) _world.violated("a post is no JSON document: " + parsed.error);
-  const auto* events = document ? document->array("events") : nullptr;
-  if (!events) return 0;
-  std::map<std::string, int> ofMethod;
-  for (const platform::Value& event : *events) {
-    const auto* record = event.dictionary();
-    if (++ofMethod[std::string(record->string("_method").value_or(""))] > kHighestEventThreshold + 1) {
-      _world.violated("a batch had more events of one method than it may hold");
-    }
-    if (const auto serial = record->integer(kSerialKey))
-      _world.arrived(Channel::Post, *serial, kMostPostBackends);
-  }
-  return events->size();
-}
-
-HTTPResult SimulatedHTTP::postResult(const std::string& url, std::size_t events) {
-  Received& received = _world.received;
-  received.eventsUnderWay -= events;
+HTTPResult SimulatedHTTP::postResult(const std::string& url) {
   if (_world.draws.chance(_world.weather.postFindsNoRoom)) {
-    received.eventsWithoutRoom += events;
     HTTPResult result = fakes::FakeHTTPClient::failure("too much waits");
     result.failure = platform::HTTPFailure::TooMuchWaits;
     return result;
   }
   // A session that needs no user info may have no server to post to.
   if (url.empty() || _world.draws.chance(_world.weather.postFails)) {
-    received.eventsFailed += events;
-    return fakes::FakeHTTPClient::failure("no way to the collector");
+    constexpr double kPermanentShare = 0.1;
+    HTTPResult result = fakes::FakeHTTPClient::failure("no way to the collector");
+    if (url.empty() || _world.draws.chance(kPermanentShare))
+      result.failure = platform::HTTPFailure::Permanent;
+    return result;
   }
-  const bool refused = _world.draws.chance(_world.weather.postIsRefused);
-  (refused ? received.eventsRefused : received.eventsTaken) += events;
-  return answer(refused ? 503 : 200, "");
+  return _world.draws.chance(_world.weather.postIsRefused) ? refusedPost() : answer(200, "");
+}
+
+HTTPResult SimulatedHTTP::refusedPost() {
+  // The first four say that another attempt may end otherwise.
+  constexpr std::array kStatuses{503, 429, 502, 504, 400, 413, 500};
+  constexpr int kMostSeconds = 1200;  // More than a client that tries again has patience for.
+  HTTPResult result = answer(_world.draws.pick(kStatuses), "");
+  if (_world.draws.chance(0.3)) {
+    result.response->headers.emplace_back(kRetryAfter, std::to_string(_world.draws.between(0, kMostSeconds)));
+  }
+  return result;
 }
 
 }  // namespace tallyd::replay

@@ -1,5 +1,6 @@
 #include "replay/Simulation.h"
 
+#include "daemon/Drain.h"
 #include "replay/Clients.h"
 #include "replay/Invariants.h"
 #include "replay/World.h"
@@ -7,12 +8,15 @@
 namespace tallyd::replay {
 
 using std::chrono::hours;
-using std::chrono::minutes;
 
 namespace {
 
-/// Longer than 21 ticks of any dashboard, a clean-up's last resort and the slowest post.
-constexpr minutes kAfterTheDay{10};
+/// All ends within it, 21 ticks of any dashboard and a clean-up's last resort included.
+constexpr auto kAfterTheDay = kLongDrain;
+
+AgentOptions agentOptions(const OptIns& optIns) {
+  return {.fatalFailures = optIns.fatalFailures, .consentChecks = optIns.consentChecks};
+}
 
 class Simulation {
  public:
@@ -22,9 +26,11 @@ class Simulation {
         _tap(std::make_shared<Tap>(_world.platform().queues, _world.platform().clock)),
         _ledger(std::make_shared<Ledger>(_tap)),
         _ownQueues(_world.surroundings().queues.liveQueues()),
-        _agent(_world.platform(), _ledger),
-        _clients(_agent, _world),
-        _invariants(*_ledger, _world.surroundings()) {
+        _agent(_world.platform(), _ledger, agentOptions(scenario.optIns)),
+        _model(_world.surroundings()),
+        _clients(_agent, _world, _model),
+        _invariants(*_ledger, _world.surroundings(), _model) {
+    trace("opt-ins: {}", description(scenario.optIns));
     _world.afterStep = [this] { _invariants.check(); };
   }
 
@@ -80,12 +86,50 @@ class Simulation {
 
   void endTheDay() {
     _world.runUntil(_scenario.length);
-    _clients.disconnectAll();
+    if (_scenario.optIns.drain) {
+      drain(*_scenario.optIns.drain);
+    } else {
+      _clients.disconnectAll();
+    }
     _world.settle();
     _invariants.check();
     _world.runUntil(_world.surroundings().queues.now() + kAfterTheDay);
     _invariants.checkEnd(_ownQueues);
   }
+
+  /// As the daemon ends: nobody leaves by himself.
+  void drain(Milliseconds time) {
+    trace("the daemon ends the sessions");
+    _agent.endSessions();
+    _clients.disconnectEnded();
+    if (_clients.open() > 0) _world.surroundings().violated("a drain left connections open");
+    std::optional<Drain::End> ended;
+    Drain drain(_world.platform().queues, *_ledger);
+    const Milliseconds begun = now();
+    drain.start(time, [&](Drain::End end) {
+      checkDrain(end, now() - begun, time);
+      ended = end;
+    });
+    _world.runUntil(begun + time);
+    if (!ended) _world.surroundings().violated("a drain did not end in its time");
+    _isDrainSettled = ended == Drain::End::Settled;
+  }
+
+  void checkDrain(Drain::End end, Milliseconds elapsed, Milliseconds time) {
+    const SessionCounts totals = _ledger->totals();
+    trace("{}", balanceLine(totals));
+    Surroundings& world = _world.surroundings();
+    const bool isSettled = end == Drain::End::Settled;
+    const Received& received = world.received;
+    const bool isUnderWay = unfinishedOf(totals) > 0 || received.postsUnderWay > 0;
+    if (isSettled && isUnderWay) world.violated("a drain ended with something under way");
+    // A dashboard without datagrams ends with its next tick.
+    if (!isSettled && !isUnderWay && received.openSockets == 0) world.violated("a drain waited for nothing");
+    if (!isSettled && elapsed != time) world.violated("a drain was given up early");
+    if (!isSettled && time >= kLongDrain) world.violated("a long drain left something unfinished");
+  }
+
+  [[nodiscard]] Milliseconds now() { return _world.surroundings().queues.now(); }
 
   Outcome outcome() {
     Surroundings& world = _world.surroundings();
@@ -95,7 +139,8 @@ class Simulation {
                     .violations = world.violations.kept(),
                     .received = world.received,
                     .connections = _clients.connections(),
-                    .calls = _clients.calls()};
+                    .calls = _clients.calls(),
+                    .isDrainSettled = _isDrainSettled};
     for (auto found = outcome.trace.find("Deleting expired"); found != std::string::npos;
          found = outcome.trace.find("Deleting expired", found + 1)) {
       ++outcome.messageLogsDeleted;
@@ -115,8 +160,10 @@ class Simulation {
   const std::shared_ptr<Ledger> _ledger;
   const std::size_t _ownQueues;
   TallydAgent _agent;
+  PostModel _model;
   Clients _clients;
   Invariants _invariants;
+  std::optional<bool> _isDrainSettled;
 };
 
 }  // namespace
@@ -127,26 +174,31 @@ std::string summary(const Outcome& outcome) {
   const Received& received = outcome.received;
   std::string text = fmt::format(
       "{} sessions, {} calls, {} storebag fetches ({} failed), {} posts with {} events ({} refused, {} "
-      "failed), "
+      "failed, {} uncertain, {} saved by {} further attempts), "
       "{} datagrams and {} reliable ones ({} retransmissions, {} acknowledged), {} uploads ({} failed), "
       "{} log data, {} power records, {} adaptor messages, {} message logs deleted, {} lines of trace; "
       "dropped:",
       outcome.connections, outcome.calls, received.fetches, received.fetchesFailed, received.posts,
-      received.eventsTaken + received.eventsRefused + received.eventsFailed + received.eventsWithoutRoom,
-      received.eventsRefused, received.eventsFailed + received.eventsWithoutRoom, received.plainDatagrams,
-      received.reliableDatagrams, received.retransmissions, received.acknowledged,
-      received.uploads + received.uploadsFailed, received.uploadsFailed, received.logData,
-      received.powerRecords, received.adaptorMessages, outcome.messageLogsDeleted, outcome.traceLines);
+      received.eventsTaken + received.eventsRefused + received.eventsFailed + received.eventsWithoutRoom +
+          received.eventsUncertain,
+      received.eventsRefused, received.eventsFailed + received.eventsWithoutRoom, received.eventsUncertain,
+      received.eventsSaved, received.furtherAttempts, received.plainDatagrams, received.reliableDatagrams,
+      received.retransmissions, received.acknowledged, received.uploads + received.uploadsFailed,
+      received.uploadsFailed, received.logData, received.powerRecords, received.adaptorMessages,
+      outcome.messageLogsDeleted, outcome.traceLines);
   for (const auto& [reason, count] : outcome.dropped) text += fmt::format(" {} {}", reason, count);
   return text;
 }
 
 Scenario dayOfSeed(std::uint64_t seed, hours length) {
-  return withFaults(makeScenario(seed, length), seed + 1);
+  return scenarioOf({.seed = seed, .length = length, .faults = seed + 1});
 }
 
-std::string commandFor(std::uint64_t seed, hours length) {
-  return fmt::format("scripts/replay --seed {} --hours {}", seed, length.count());
+std::optional<std::string> commandFor(const Scenario& scenario) {
+  if (!scenario.recipe) return std::nullopt;
+  const Recipe& recipe = *scenario.recipe;
+  const std::string faults = recipe.faults ? fmt::format("--faults {}", *recipe.faults) : "--fine";
+  return fmt::format("scripts/replay --seed {} --hours {} {}", recipe.seed, recipe.length.count(), faults);
 }
 
 }  // namespace tallyd::replay

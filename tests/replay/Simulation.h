@@ -3,6 +3,7 @@
 
 #include <cstddef>
 #include <map>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -21,6 +22,7 @@ struct Outcome {
   std::size_t connections = 0;
   std::size_t calls = 0;
   std::size_t messageLogsDeleted = 0;
+  std::optional<bool> isDrainSettled{};            ///< Nothing without a drain.
   std::map<std::string, std::uint64_t> dropped{};  ///< By reason.
 };
 
@@ -31,10 +33,11 @@ struct Outcome {
 /// "3 sessions, 5 calls, …": one line for people.
 [[nodiscard]] std::string summary(const Outcome& outcome);
 
-/// The day that this seed and length stand for everywhere: withFaults(makeScenario(…)).
+/// The day that this seed and length stand for where nothing else is said: withFaults(makeScenario(…)), with
+/// the faults of the next seed.
 [[nodiscard]] Scenario dayOfSeed(std::uint64_t seed, std::chrono::hours length);
 
-/// What runs this day again.
-[[nodiscard]] std::string commandFor(std::uint64_t seed, std::chrono::hours length);
+/// What runs this day again: the replay script with its options. Nothing for a day that was written by hand.
+[[nodiscard]] std::optional<std::string> commandFor(const Scenario& scenario);
 
 }  // namespace tallyd::replay

@@ -1,5 +1,6 @@
 #include "replay/Storebags.h"
 
+#include <algorithm>
 #include <array>
 #include <string>
 
@@ -74,14 +75,33 @@ Dictionary section(int index, int edition) {
 
 }  // namespace
 
+bool isStorebagName(std::string_view name) {
+  return std::find(kNames.begin(), kNames.end(), name) != kNames.end();
+}
+
+std::optional<std::string_view> storebagNameOf(std::int64_t clientType) {
+  constexpr std::int64_t kFirstClientType = 5;
+  const std::int64_t index = clientType - kFirstClientType;
+  if (index < 0 || index >= static_cast<std::int64_t>(kNames.size())) return std::nullopt;
+  return kNames[static_cast<std::size_t>(index)];
+}
+
 Dictionary storebagNamed(std::string_view name, int edition) {
-  const Dictionary environment = section(indexOf(name), edition);
+  const Dictionary environment = sectionOf(name, edition);
   return {{"version", "edition " + std::to_string(edition)},
           {"release", environment},
           {"quillon_internal", environment}};
 }
 
+Dictionary sectionOf(std::string_view name, int edition) { return section(indexOf(name), edition); }
+
 Dictionary storebagWithoutSections() { return {{"version", "empty"}}; }
+
+Dictionary storebagWithoutVersion(std::string_view name, int edition) {
+  Dictionary bag = storebagNamed(name, edition);
+  bag.remove("version");
+  return bag;
+}
 
 std::chrono::milliseconds dashboardPeriod(std::uint16_t port) {
   const int period = kReliablePeriods.at(static_cast<std::size_t>(port - kFirstPort));

@@ -3,12 +3,15 @@
 
 #include <cstdint>
 #include <functional>
+#include <map>
+#include <optional>
 #include <string>
 
 #include "fakes/FakeQueues.h"
 #include "platform/Clock.h"
 #include "replay/Draws.h"
 #include "replay/Received.h"
+#include "replay/Scenario.h"
 #include "replay/Trace.h"
 #include "replay/Weather.h"
 
@@ -34,7 +37,9 @@ class SimulatedClock : public platform::Clock {
 
 /// Borrowed by each part; lives in the World.
 struct Surroundings {
-  explicit Surroundings(std::uint64_t seed) : draws(seed) {}
+  explicit Surroundings(const Scenario& scenario) : optIns(scenario.optIns), draws(scenario.seed ^ 0x5EEDU) {}
+
+  const OptIns optIns;
 
   fakes::FakeQueues queues;
   SimulatedClock clock{queues};
@@ -47,6 +52,10 @@ struct Surroundings {
   bool isOneShotCall = false;      ///< Sockets that are made now are for one message.
   bool isSessionEnding = false;    ///< What is sent now is a session's last record.
   int edition = 0;                 ///< Of the storebags that the servers give out.
+  std::map<std::string, int, std::less<>> editionsTaken;  ///< By storebag: what the daemon has of it.
+  bool hasConsent = false;                                ///< As the preferences stand.
+  std::optional<std::string> country;
+  double samplingFactor = 0;  ///< Of all backends that are made within one call.
   /// Lets time pass within a call that waits: everything else goes on meanwhile.
   std::function<void(std::chrono::milliseconds)> elapse;
 

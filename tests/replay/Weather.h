@@ -25,6 +25,7 @@ struct Weather {
   std::chrono::milliseconds longestFetch{400};
   std::chrono::milliseconds longestUpload{900};
   std::chrono::milliseconds longestRoundTrip{200};
+  bool operator==(const Weather&) const = default;
 };
 
 }  // namespace tallyd::replay

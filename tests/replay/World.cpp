@@ -20,12 +20,13 @@ constexpr std::array kAdaptorBundles{
 
 }  // namespace
 
-World::World(const Scenario& scenario) : _world(scenario.seed ^ 0x5EEDU) {
+World::World(const Scenario& scenario) : _world(scenario) {
   _world.elapse = [this](Milliseconds duration) {
     ++_world.callsWaiting;
     runUntil(_world.queues.now() + duration);
     --_world.callsWaiting;
   };
+  _world.country = _locale.country;
   _world.trace.setRoot(_folder.path().string());
   _device.answers = {{"UniqueDeviceID", "0123456789abcdef0123456789abcdef01234567"},
                      {"ProductVersion", "12.4"},
@@ -50,6 +51,13 @@ World::World(const Scenario& scenario) : _world(scenario.seed ^ 0x5EEDU) {
   _defaults.setValue("logFileCreationDate", Value(platform::Date{static_cast<double>(seconds)}));
 }
 
+platform::HTTPClient& World::withRetries() {
+  const auto limits = retryLimitsOf(_world.optIns);
+  if (!limits) return _network;
+  return _retrying.emplace(_network, _world.clock, _randomness, _log, *limits,
+                           [this] { return platform::RetryingHTTPClient::Moment(_world.queues.now()); });
+}
+
 void World::runUntil(Milliseconds moment) {
   while (_world.queues.advanceToNext(moment)) {
     settle();
@@ -63,6 +71,12 @@ void World::set(const SetPreference& change) {
   } else {
     _preferences.values.erase(change.suite + "/" + change.key);
   }
+  if (change.key == kConsentKey) _world.hasConsent = change.value && change.value->booleanValue();
+}
+
+void World::set(const SetCountry& change) {
+  _locale.country = change.country;
+  _world.country = change.country;
 }
 
 void World::lose(Loss what) {

@@ -3,6 +3,7 @@
 
 #include <filesystem>
 #include <functional>
+#include <optional>
 
 #include "fakes/FakeCodeBundles.h"
 #include "fakes/FakeLocale.h"
@@ -10,6 +11,8 @@
 #include "fakes/FakeSettings.h"
 #include "fakes/TemporaryFolder.h"
 #include "platform/Platform.h"
+#include "platform/http/RetryingHTTPClient.h"
+#include "replay/PostWatch.h"
 #include "replay/Scenario.h"
 #include "replay/SimulatedAdaptor.h"
 #include "replay/SimulatedDatagrams.h"
@@ -37,7 +40,7 @@ class World {
   std::function<void()> afterStep = [] {};
 
   void set(const SetPreference& change);
-  void set(const SetCountry& change) { _locale.country = change.country; }
+  void set(const SetCountry& change);
   void lose(Loss what);
   /// Makes the file as `upload` has it; its path.
   std::filesystem::path makeFile(const UploadFile& upload) const;
@@ -45,13 +48,19 @@ class World {
   [[nodiscard]] std::size_t messageLogFiles() const;
 
  private:
+  /// The client that the daemon gets: the simulated network's own without retries.
+  platform::HTTPClient& withRetries();
+
   Surroundings _world;
   fakes::TemporaryFolder _folder;
   platform::Root _root{_folder.path()};
   TraceLog _log{_world.trace};
   SimulatedRandomness _randomness{_world};
   fakes::FakeLocale _locale;
-  SimulatedHTTP _http{_world};
+  PostWatch _posts{_world};
+  SimulatedHTTP _network{_world, _posts};
+  std::optional<platform::RetryingHTTPClient> _retrying;
+  WatchedHTTP _http{withRetries(), _posts};
   fakes::FakePreferences _preferences;
   SimulatedDefaults _defaults;
   SimulatedDeviceProperties _device{_world};
