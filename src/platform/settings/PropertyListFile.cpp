@@ -2,6 +2,7 @@
 
 #include <cerrno>
 #include <system_error>
+#include <utility>
 
 #include "platform/property-list/PropertyList.h"
 #include "platform/settings/FileReading.h"
@@ -11,6 +12,11 @@ namespace tallyd::platform {
 namespace {
 
 bool meansMissing(int errorNumber) { return errorNumber == ENOENT || errorNumber == ENOTDIR; }
+
+/// Whether the same file may be read the next time.
+bool passesBy(int errorNumber) {
+  return errorNumber == EMFILE || errorNumber == ENFILE || errorNumber == ENOMEM || errorNumber == EIO;
+}
 
 std::int64_t nanoseconds(const timespec& time) {
   return static_cast<std::int64_t>(time.tv_sec) * 1'000'000'000 + time.tv_nsec;
@@ -53,15 +59,26 @@ std::optional<Value> PropertyListFile::value(std::string_view key) const {
 }
 
 std::string PropertyListFile::refresh(const Identity& current) const {
-  _known = current;
+  _known.reset();
   _contents = Dictionary();
-  if (meansMissing(current.errorNumber)) return {};
-  if (current.errorNumber != 0) return std::generic_category().message(current.errorNumber);
+  if (current.errorNumber != 0) {
+    _known = current;
+    return meansMissing(current.errorNumber) ? std::string()
+                                             : std::generic_category().message(current.errorNumber);
+  }
   FileContents file = readFile(_path);
-  if (!file.bytes) return meansMissing(file.errorNumber) ? std::string() : std::move(file.error);
+  if (passesBy(file.errorNumber)) {
+    const bool isNew = std::exchange(_passingError, file.errorNumber) != file.errorNumber;
+    return isNew ? std::move(file.error) : std::string();
+  }
+  _passingError = 0;
+  if (!file.bytes) {
+    _known = current;
+    return meansMissing(file.errorNumber) ? std::string() : std::move(file.error);
+  }
+  DictionaryResult read = dictionaryWithData(*file.bytes);
   // The file may have been replaced since its status was asked for; what counts is the one that was read.
   _known = identity(file.status);
-  DictionaryResult read = dictionaryWithData(*file.bytes);
   if (!read.dictionary) return std::move(read.error);
   _contents = std::move(*read.dictionary);
   return {};

@@ -20,7 +20,8 @@ namespace tallyd::platform {
 /// Each question looks at the file's status only; the file is read when device, inode, size or one of the
 /// times of change differ from when it was last read. A missing file has no entries. Neither has one that
 /// can't be read, isn't a property list, or holds no dictionary; that costs one line in the log for each
-/// change of the file.
+/// change of the file. One that can't be read for want of descriptors or memory, or by an error of the disk,
+/// is tried again at the next question.
 ///
 /// Threading: any thread. The file is read under this object's lock, so that one change is read and
 /// complained of once.
@@ -55,6 +56,7 @@ class PropertyListFile {
   mutable std::mutex _mutex;
   mutable std::optional<Identity> _known;  ///< Guarded by `_mutex`, as is the next.
   mutable Dictionary _contents;
+  mutable int _passingError = 0;  ///< Of the last attempt to read, if it may pass by; complained of once.
 };
 
 /// The dictionary in the property list `bytes`, or why there is none.

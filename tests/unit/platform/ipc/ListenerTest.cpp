@@ -1,6 +1,5 @@
 #include <fcntl.h>
 #include <spawn.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 
@@ -8,6 +7,7 @@
 #include <future>
 
 #include "IPCTest.h"
+#include "support/FewDescriptors.h"
 
 extern char** environ;
 
@@ -101,24 +101,6 @@ TEST_F(ListenerTest, ClientsThatCameBeforeItWasResumedAreServed) {
   EXPECT_TRUE(service.events.waitFor("Nothing"));
 }
 
-/// Lets the process open only `spare` descriptors more for as long as it lives.
-class FewDescriptors {
- public:
-  explicit FewDescriptors(int spare) {
-    ::getrlimit(RLIMIT_NOFILE, &_before);
-    const FileDescriptor next(::open("/dev/null", O_RDONLY | O_CLOEXEC));
-    auto limit = _before;
-    limit.rlim_cur = static_cast<rlim_t>(next.get() + spare);
-    ::setrlimit(RLIMIT_NOFILE, &limit);
-  }
-  ~FewDescriptors() { ::setrlimit(RLIMIT_NOFILE, &_before); }
-  FewDescriptors(const FewDescriptors&) = delete;
-  FewDescriptors& operator=(const FewDescriptors&) = delete;
-
- private:
-  rlimit _before{};
-};
-
 TEST_F(ListenerTest, WithoutDescriptorsItSaysSoOnceAndServesTheRestLater) {
   constexpr std::size_t kClients = 40;
   constexpr std::size_t kBatch = 5;
@@ -133,7 +115,7 @@ TEST_F(ListenerTest, WithoutDescriptorsItSaysSoOnceAndServesTheRestLater) {
   // buffer.
   asl_log(_log, LogLevel::Debug, "{}", "first");
   _log.clear();
-  const FewDescriptors few(kSpare);
+  const test::FewDescriptors few(kSpare);
   service.resume();
   ASSERT_TRUE(service.events.waitFor("Nothing", kBatch));
   EXPECT_LT(service.events.count("accepted"), kClients);

@@ -7,6 +7,7 @@
 
 #include "SettingsFolder.h"
 #include "platform/settings/PropertyListFile.h"
+#include "support/FewDescriptors.h"
 
 namespace tallyd::platform {
 namespace {
@@ -115,6 +116,25 @@ TEST_F(FilePreferencesTest, AnUnreadableFileIsLoggedOnce) {
   EXPECT_EQ(value("key"), std::nullopt);
   EXPECT_EQ(_log.lines(), (std::vector<fakes::FakeLog::Line>{
                               {LogLevel::Error, "Cannot read " + fullPath() + ": not a regular file"}}));
+}
+
+TEST_F(FilePreferencesTest, AFileThatCannotBeReadForTheMomentIsReadOnceItCan) {
+  writeList(kFile, Dictionary{{"key", "value"}});
+  {
+    const test::FewDescriptors none(0);
+    EXPECT_EQ(value("key"), std::nullopt);
+    EXPECT_EQ(value("key"), std::nullopt);
+  }
+  EXPECT_EQ(_log.lines(), (std::vector<fakes::FakeLog::Line>{
+                              {LogLevel::Error, "Cannot read " + fullPath() + ": Too many open files"}}));
+  EXPECT_EQ(value("key"), Value("value"));
+  writeList(kFile, Dictionary{{"key", "another"}});
+  {
+    const test::FewDescriptors none(0);
+    EXPECT_EQ(value("key"), std::nullopt);
+  }
+  EXPECT_EQ(_log.lines().size(), 2U);
+  EXPECT_EQ(value("key"), Value("another"));
 }
 
 TEST_F(FilePreferencesTest, AFileWhoseStatusCannotBeReadIsLoggedOnce) {
