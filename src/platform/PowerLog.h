@@ -13,7 +13,8 @@ class PowerLog {
  public:
   virtual ~PowerLog() = default;
 
-  /// Records one event under its registered number and name. A failure is the log's own business.
+  /// Records one event under its registered number and name. Throws std::system_error when it is not
+  /// recorded, which the log has told of itself.
   virtual void WBLogRegisteredEvent(std::int32_t number, std::string_view name, const Dictionary& record) = 0;
 };
 

@@ -20,7 +20,7 @@ enum class DropReason : std::uint8_t {
   // Datagrams.
   QueueFull,    ///< The oldest of those that waited, when one more came.
   GivenUp,      ///< Not acknowledged after the last retransmission.
-  OutOfMemory,  ///< No memory for the datagram, or for the document that was to be posted.
+  OutOfMemory,  ///< No memory for the datagram, for the document that was to be posted, or for log data.
   // Whatever a backend still had when it went.
   CleanUp,
   // Uploads.
@@ -29,20 +29,22 @@ enum class DropReason : std::uint8_t {
   // Adaptors and the power log.
   AdaptorUnavailable,  ///< There is no adaptor, or it does not take messages.
   AdaptorThrew,
-  NoMethod,   ///< Method 0 is not recorded.
-  NoPayload,  ///< Nothing to record.
+  NoMethod,     ///< Method 0 is not recorded.
+  NoPayload,    ///< Nothing to record.
+  NotRecorded,  ///< The power log could not write it.
   // A session's own books.
   NoBackends,     ///< The session is not started, or its storebag makes no backend.
   NoStorebag,     ///< A one-shot message for which there is no storebag.
   NoSessionInfo,  ///< A one-shot message without the identifiers that it must have.
 };
 
-inline constexpr std::array<std::string_view, 20> kDropReasonNames{
-    "state-off",     "method-limit",        "not-postable",      "no-client-identifier",
-    "post-failed",   "memory-bound",        "consent-withdrawn", "queue-full",
-    "given-up",      "out-of-memory",       "clean-up",          "not-uploadable",
-    "upload-failed", "adaptor-unavailable", "adaptor-threw",     "no-method",
-    "no-payload",    "no-backends",         "no-storebag",       "no-session-info"};
+inline constexpr std::array<std::string_view, 21> kDropReasonNames{
+    "state-off",      "method-limit",        "not-postable",      "no-client-identifier",
+    "post-failed",    "memory-bound",        "consent-withdrawn", "queue-full",
+    "given-up",       "out-of-memory",       "clean-up",          "not-uploadable",
+    "upload-failed",  "adaptor-unavailable", "adaptor-threw",     "no-method",
+    "no-payload",     "not-recorded",        "no-backends",       "no-storebag",
+    "no-session-info"};
 inline constexpr std::size_t kDropReasonCount = kDropReasonNames.size();
 static_assert(static_cast<std::size_t>(DropReason::NoSessionInfo) + 1 == kDropReasonCount);
 

@@ -9,6 +9,7 @@
 #include <new>
 #include <system_error>
 
+#include "platform/AppendWhole.h"
 #include "platform/FileDescriptor.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
@@ -56,21 +57,8 @@ std::optional<Date> creationDate(const std::string& path) {
 std::string describe(const std::optional<std::string>& path) { return path.value_or("(null)"); }
 std::string describe(const std::optional<Date>& date) { return date ? Value(*date).description() : "(null)"; }
 
-std::string errorText(int error) { return std::generic_category().message(error); }
-
 FileDescriptor openForLine(const std::string& path) {
   return FileDescriptor(::open(path.c_str(), O_WRONLY | O_APPEND | O_CLOEXEC));
-}
-
-/// Writes all of `text`; the error's number when it can't.
-int writeAll(int descriptor, std::string_view text) {
-  while (!text.empty()) {
-    const ssize_t written = ::write(descriptor, text.data(), text.size());
-    if (written < 0 && errno == EINTR) continue;
-    if (written < 0) return errno;
-    text.remove_prefix(static_cast<std::size_t>(written));
-  }
-  return 0;
 }
 
 template <class Write>
@@ -197,16 +185,17 @@ MessageLog::CurrentFile MessageLog::createFile() {
   return {path, created};
 }
 
-void MessageLog::append(const CurrentFile& file, std::string_view message) {
+void MessageLog::append(CurrentFile& file, std::string_view message) {
   const std::string& date = dateText();
   std::string line;
   line.reserve(date.size() + message.size() + std::string_view("() \n").size());
   line.append("(").append(date).append(") ").append(message).append("\n");
-  const FileDescriptor opened = file.opened ? FileDescriptor() : openForLine(*file.path);
-  const FileDescriptor& descriptor = file.opened ? file.opened : opened;
-  if (const int error = descriptor ? writeAll(descriptor.get(), line) : errno) {
+  if (!file.opened) file.opened = openForLine(*file.path);
+  const std::error_code error = file.opened ? platform::appendWhole(file.opened.get(), line)
+                                            : std::error_code(errno, std::generic_category());
+  if (error) {
     asl_log(_platform.log, LogLevel::Critical, "Error writing to tallyd log file {}: {}", *file.path,
-            errorText(error));
+            error.message());
   }
   asl_log(_platform.log, LogLevel::Info, "Saved log message to {}", *file.path);
 }

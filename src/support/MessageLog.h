@@ -48,7 +48,7 @@ class MessageLog {
   struct CurrentFile {
     std::optional<std::string> path;
     std::optional<platform::Date> created;
-    platform::FileDescriptor opened{};  ///< Where it has been looked for by opening it.
+    platform::FileDescriptor opened{};  ///< Once it has been needed.
     bool isSaved = false;               ///< The defaults hold just this.
   };
 
@@ -62,7 +62,7 @@ class MessageLog {
   bool isExpired(const CurrentFile& file) const;
   void retire(const CurrentFile& file);
   CurrentFile createFile();
-  void append(const CurrentFile& file, std::string_view message);
+  void append(CurrentFile& file, std::string_view message);
   [[nodiscard]] const std::string& dateText();
   void remember(const CurrentFile& file);
 

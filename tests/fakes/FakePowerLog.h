@@ -4,6 +4,7 @@
 #include <mutex>
 #include <ostream>
 #include <string>
+#include <system_error>
 #include <vector>
 
 #include "platform/PowerLog.h"
@@ -22,9 +23,15 @@ class FakePowerLog : public platform::PowerLog {
   void WBLogRegisteredEvent(std::int32_t number, std::string_view name,
                             const platform::Dictionary& record) override {
     const std::lock_guard lock(_mutex);
+    if (_isFull) throw std::system_error(std::make_error_code(std::errc::no_space_on_device));
     _events.push_back({number, std::string(name), record});
   }
 
+  /// Whether it has no room for further events.
+  void setFull(bool isFull) {
+    const std::lock_guard lock(_mutex);
+    _isFull = isFull;
+  }
   [[nodiscard]] std::vector<Event> events() const {
     const std::lock_guard lock(_mutex);
     return _events;
@@ -33,6 +40,7 @@ class FakePowerLog : public platform::PowerLog {
  private:
   mutable std::mutex _mutex;
   std::vector<Event> _events;
+  bool _isFull = false;
 };
 
 inline std::ostream& operator<<(std::ostream& out, const FakePowerLog::Event& event) {

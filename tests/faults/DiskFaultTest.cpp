@@ -1,12 +1,15 @@
-// Disks that are full, read-only or gone under the message log: a line is lost, and no event with it.
+// Disks that are full, read-only or gone under the message log and the power log: a line is lost as a whole,
+// no event with it, and the books know.
 
 #include <gtest/gtest.h>
 #include <sys/mount.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <csignal>
 #include <fstream>
+#include <sstream>
 
 #include "faults/FaultFixture.h"
 
@@ -69,6 +72,30 @@ class DiskFaultTest : public FaultFixture {
     EXPECT_EQ(posts.sent, posts.accepted);
     EXPECT_EQ(receivedEvents(collector).size(), static_cast<std::size_t>(posts.sent));
   }
+  /// No line of the message log ends too early or begins within another one.
+  void expectWholeLines() const {
+    for (const std::string& line : root.messageLog()) {
+      EXPECT_TRUE(line.starts_with("[splunk -> ")) << line;
+      static_cast<void>(parsed(line.substr(std::min(line.size(), line.find("] ") + 2))));
+    }
+  }
+
+  /// What the books say of the power log, which holds as many records, in whole lines.
+  struct Records {
+    std::int64_t sent = 0;
+    std::int64_t lost = 0;
+  };
+  [[nodiscard]] Records settledRecords() const {
+    TallyInspection inspection(inspectionSocket());
+    const Dictionary row = rowOf(*statsWhen(inspection, nothingUnderWay).dictionary("total"), "power");
+    const Records records{number(row, "sent"),
+                          row.dictionary("dropped")->integer("not-recorded").value_or(0)};
+    std::istringstream text(root.read("/var/log/tallyd/power.jsonl"));
+    std::int64_t lines = 0;
+    for (std::string line; std::getline(text, line); ++lines) static_cast<void>(parsed(line));
+    EXPECT_EQ(lines, records.sent);
+    return records;
+  }
 };
 
 TEST_F(DiskFaultTest, GoesOnWhenTheDiskIsFullAndWritesAgainWhenItIsNot) {
@@ -82,10 +109,12 @@ TEST_F(DiskFaultTest, GoesOnWhenTheDiskIsFullAndWritesAgainWhenItIsNot) {
   if (disk.isMounted()) disk.fill();
   expectPosted(daemon, 12);
   EXPECT_TRUE(complains(daemon, "Error writing to tallyd log file")) << daemon.process().output();
+  expectWholeLines();
   if (!disk.isMounted()) return;
   disk.makeRoom();
   expectPosted(daemon, 24);
   EXPECT_GT(root.messageLog().size(), linesBefore);
+  expectWholeLines();
 }
 
 TEST_F(DiskFaultTest, OutlivesALimitOfFileSizes) {
@@ -93,6 +122,30 @@ TEST_F(DiskFaultTest, OutlivesALimitOfFileSizes) {
   expectPosted(daemon, 0);
   expectPosted(daemon, 12);
   EXPECT_TRUE(complains(daemon, "Error writing to tallyd log file")) << daemon.process().output();
+  expectWholeLines();
+}
+
+TEST_F(DiskFaultTest, BooksAsDroppedWhatAFullDiskKeepsOutOfThePowerLog) {
+  storebags.serve("playhall", {{"power", Dictionary()}}, "max-age=600");
+  const SmallDisk disk(root.under("/var"));
+  TestDaemon::Options options;
+  if (!disk.isMounted()) options.limits[RLIMIT_FSIZE] = 2000;
+  TestDaemon daemon(root, options);
+  runSession(daemon, 7, 5);
+  EXPECT_EQ(settledRecords().sent, 5);
+  if (disk.isMounted()) disk.fill();
+  constexpr int kMessages = 60;  // More than what is left of a page takes.
+  runSession(daemon, 7, kMessages);
+  const Records whenFull = settledRecords();
+  EXPECT_GT(whenFull.lost, 0);
+  EXPECT_EQ(whenFull.sent + whenFull.lost, 5 + kMessages);
+  EXPECT_EQ(linesWith(daemon, "<4>", "Can't write the power log", 1), 1U) << daemon.process().output();
+  if (!disk.isMounted()) return;
+  disk.makeRoom();
+  runSession(daemon, 7, 5);
+  const Records atTheEnd = settledRecords();
+  EXPECT_EQ(atTheEnd.sent, whenFull.sent + 5);
+  EXPECT_EQ(atTheEnd.lost, whenFull.lost);
 }
 
 TEST_F(DiskFaultTest, GoesOnWhenTheMessageLogsFolderIsReadOnly) {

@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <system_error>
 
+#include "platform/AppendWhole.h"
 #include "platform/FileDescriptor.h"
 
 namespace tallyd::station {
@@ -76,14 +77,8 @@ void replaceFile(const std::filesystem::path& path, std::string_view bytes, mode
 
 void appendToFile(const std::filesystem::path& path, std::string_view bytes) {
   const FileDescriptor file = openRegular(path, O_WRONLY | O_CREAT | O_APPEND);
-  const off_t end = ::lseek(file.get(), 0, SEEK_END);
-  try {
-    writeAll(file.get(), bytes, path);
-  } catch (...) {
-    // A part of a line would spoil the next one. When even this fails, nothing more can be done.
-    [[maybe_unused]] const int ignored = ::ftruncate(file.get(), end);
-    throw;
-  }
+  if (const auto error = platform::appendWhole(file.get(), bytes))
+    throw std::system_error(error, path.string());
 }
 
 }  // namespace tallyd::station

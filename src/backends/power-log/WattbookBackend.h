@@ -14,7 +14,7 @@ namespace tallyd {
 /// Hands each message that has a method and a payload to the power log: the payload with the method, the
 /// response code and the event ID on top. Needs no profile and keeps nothing.
 ///
-/// Books: records; one is sent when the power log has it, which says itself what it could not write.
+/// Books: records; one is sent when the power log has it, and dropped when the log says that it has not.
 /// Threading: the session's queue, which waits for the power log's disk.
 class WattbookBackend final : public TallyBackend {
  public:

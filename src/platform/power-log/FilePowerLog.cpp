@@ -6,6 +6,7 @@
 #include <cerrno>
 #include <system_error>
 
+#include "platform/AppendWhole.h"
 #include "platform/power-log/PowerLogLine.h"
 
 namespace tallyd::platform {
@@ -16,22 +17,6 @@ constexpr std::string_view kPath = "/var/log/tallyd/power.jsonl";
 constexpr mode_t kMode = 0640;
 
 [[noreturn]] void fail(const char* what) { throw std::system_error(errno, std::generic_category(), what); }
-
-/// Writes the whole line or takes back what of it was written.
-void writeWhole(int file, std::string_view line, off_t end) {
-  std::size_t written = 0;
-  while (written < line.size()) {
-    const ssize_t count = ::write(file, line.data() + written, line.size() - written);
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) {
-      const int reason = errno;
-      if (written > 0 && ::ftruncate(file, end) != 0) fail("a part of a line can't be taken back");
-      errno = reason;
-      fail("write");
-    }
-    written += static_cast<std::size_t>(count);
-  }
-}
 
 }  // namespace
 
@@ -49,6 +34,7 @@ void FilePowerLog::WBLogRegisteredEvent(std::int32_t number, std::string_view na
       asl_log(_log, LogLevel::Warning, "Can't write the power log {}: {}", _path.string(), error.what());
     }
     _failing = true;
+    throw;
   }
 }
 
@@ -59,7 +45,7 @@ void FilePowerLog::append(std::string_view line) const {
     retireFile();
     file = openFile();
   }
-  writeWhole(file.descriptor.get(), line, file.bytes);
+  if (const auto error = appendWhole(file.descriptor.get(), line)) throw std::system_error(error, "write");
 }
 
 FilePowerLog::OpenFile FilePowerLog::openFile() const {

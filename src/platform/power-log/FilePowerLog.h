@@ -24,7 +24,7 @@ namespace tallyd::platform {
 ///
 /// The process is the file's one writer. The file is opened for each line: when another program moves it
 /// away, the next line begins a new one. A line that can't be written is lost as a whole; the first of a row
-/// of such failures is logged.
+/// of such failures is logged, and each is thrown.
 ///
 /// Threading: any thread; calls are serialised by an internal lock, and each blocks on the disk, never on a
 /// pipe or device.

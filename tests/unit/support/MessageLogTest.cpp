@@ -9,6 +9,7 @@
 
 #include "fakes/FakePlatform.h"
 #include "fakes/TooLarge.h"
+#include "support/FileSizeLimit.h"
 
 namespace tallyd {
 namespace {
@@ -276,6 +277,19 @@ TEST_F(MessageLogTest, SaysWhenALineCouldNotBeWritten) {
   EXPECT_TRUE(
       logged(LogLevel::Critical, "Error writing to tallyd log file /dev/full: No space left on device"));
   EXPECT_TRUE(logged(LogLevel::Info, "Saved log message to /dev/full"));
+}
+
+TEST_F(MessageLogTest, LosesALineForWhichThereIsNoRoomAsAWhole) {
+  log.writeMessageLog("one");
+  const std::string first = read(path(currentName()));
+  {
+    const test::FileSizeLimit limit(first.size() + 10);
+    log.writeMessageLog("two");
+  }
+  log.writeMessageLog("three");
+  EXPECT_EQ(read(path(currentName())), first + "(" + now() + ") three\n");
+  EXPECT_TRUE(logged(LogLevel::Critical,
+                     "Error writing to tallyd log file " + path(currentName()) + ": File too large"));
 }
 
 TEST_F(MessageLogTest, WritesToTheFileThatHasTakenTheCurrentOnesPlace) {

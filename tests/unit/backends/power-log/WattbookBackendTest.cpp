@@ -86,5 +86,21 @@ TEST_F(WattbookBackendTest, BooksWhatItRecordsAndWhatItDoesNot) {
   EXPECT_TRUE(counts.isBalanced());
 }
 
+TEST_F(WattbookBackendTest, BooksAsDroppedWhatThePowerLogHasNotRecorded) {
+  send(Dictionary{{"a", 1}}, 1);
+  fake.powerLog.setFull(true);
+  EXPECT_EQ(send(Dictionary{{"a", 2}}, 1), std::nullopt);
+  EXPECT_EQ(send(Dictionary{{"a", 3}}, 1), std::nullopt);
+  fake.powerLog.setFull(false);
+  send(Dictionary{{"a", 4}}, 1);
+  const auto counts = backend->account().counts();
+  EXPECT_EQ(counts.accepted, 4U);
+  EXPECT_EQ(counts.sent, 2U);
+  EXPECT_EQ(*counts.dictionary().dictionary("dropped"), (Dictionary{{"not-recorded", 2}}));
+  EXPECT_TRUE(counts.isBalanced());
+  EXPECT_EQ(fake.powerLog.events().size(), 2U);
+  EXPECT_TRUE(fake.log.lines().empty());
+}
+
 }  // namespace
 }  // namespace tallyd

@@ -5,6 +5,7 @@
 
 #include <fstream>
 #include <sstream>
+#include <system_error>
 #include <thread>
 #include <vector>
 
@@ -13,6 +14,7 @@
 #include "fakes/TemporaryFolder.h"
 #include "platform/JSON.h"
 #include "platform/power-log/PowerLogLine.h"
+#include "support/FileSizeLimit.h"
 
 namespace tallyd::platform {
 namespace {
@@ -26,8 +28,11 @@ class FilePowerLogTest : public testing::Test {
     text << std::ifstream(path).rdbuf();
     return text.str();
   }
-  void logEvent(PowerLog& powerLog, int event) {
+  static void logEvent(PowerLog& powerLog, int event) {
     powerLog.WBLogRegisteredEvent(28, "StagehostD-RTC", {{"event", event}});
+  }
+  static void expectLost(PowerLog& powerLog, int event) {
+    EXPECT_THROW(logEvent(powerLog, event), std::system_error);
   }
   [[nodiscard]] std::string lineOf(int event) const {
     return powerLogLine(clock.now(), 28, "StagehostD-RTC", {{"event", event}});
@@ -108,8 +113,8 @@ TEST_F(FilePowerLogTest, BeginsANewFileWhenTheOldOneWasMovedAway) {
 TEST_F(FilePowerLogTest, LogsTheFirstOfARowOfFailures) {
   FilePowerLog powerLog(root, clock, log);
   fs::create_directories(path);  // A folder in the file's place.
-  logEvent(powerLog, 1);
-  logEvent(powerLog, 2);
+  expectLost(powerLog, 1);
+  expectLost(powerLog, 2);
   const std::string line = "Can't write the power log " + path.string() + ": open: Is a directory";
   EXPECT_EQ(log.lines(), (std::vector<fakes::FakeLog::Line>{{LogLevel::Warning, line}}));
   fs::remove(path);
@@ -117,18 +122,31 @@ TEST_F(FilePowerLogTest, LogsTheFirstOfARowOfFailures) {
   EXPECT_EQ(textOf(path), lineOf(3));
   fs::remove(path);
   fs::create_directories(path);
-  logEvent(powerLog, 4);
+  expectLost(powerLog, 4);
   EXPECT_EQ(log.count(LogLevel::Warning, line), 2U);
+}
+
+TEST_F(FilePowerLogTest, LosesALineForWhichThereIsNoRoomAsAWhole) {
+  FilePowerLog powerLog(root, clock, log);
+  logEvent(powerLog, 1);
+  {
+    const test::FileSizeLimit limit(lineOf(1).size() + 10);
+    expectLost(powerLog, 2);
+  }
+  logEvent(powerLog, 3);
+  EXPECT_EQ(textOf(path), lineOf(1) + lineOf(3));
+  EXPECT_TRUE(
+      log.has(LogLevel::Warning, "Can't write the power log " + path.string() + ": write: File too large"));
 }
 
 TEST_F(FilePowerLogTest, NeitherWaitsForAPipeNorFollowsALink) {
   FilePowerLog powerLog(root, clock, log);
   fs::create_directories(path.parent_path());
   ASSERT_EQ(::mkfifo(path.c_str(), 0600), 0);
-  logEvent(powerLog, 1);
+  expectLost(powerLog, 1);
   fs::remove(path);
   fs::create_symlink(folder.path() / "elsewhere", path);
-  logEvent(powerLog, 2);
+  expectLost(powerLog, 2);
   EXPECT_FALSE(fs::exists(folder.path() / "elsewhere"));
   EXPECT_EQ(log.lines().size(), 1U);
 }
@@ -136,7 +154,7 @@ TEST_F(FilePowerLogTest, NeitherWaitsForAPipeNorFollowsALink) {
 TEST_F(FilePowerLogTest, SurvivesAFolderThatCannotBeMade) {
   FilePowerLog powerLog(root, clock, log);
   std::ofstream(root.under("/var")) << "a file";
-  logEvent(powerLog, 1);
+  expectLost(powerLog, 1);
   EXPECT_TRUE(log.hasTextStartingWith(LogLevel::Warning, "Can't write the power log " + path.string()));
 }
 

@@ -2,13 +2,12 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 
-#include <csignal>
 #include <system_error>
 
 #include "fakes/TemporaryFolder.h"
+#include "support/FileSizeLimit.h"
 
 namespace tallyd::station {
 
@@ -26,26 +25,6 @@ std::string errorOf(Action&& action) {
     return error.what();
   }
 }
-
-/// Lets no file of this process grow beyond a size.
-class FileSizeLimit {
- public:
-  explicit FileSizeLimit(rlim_t bytes) : _handler(std::signal(SIGXFSZ, SIG_IGN)) {
-    ::getrlimit(RLIMIT_FSIZE, &_before);
-    const rlimit limit{bytes, _before.rlim_max};
-    ::setrlimit(RLIMIT_FSIZE, &limit);
-  }
-  ~FileSizeLimit() {
-    ::setrlimit(RLIMIT_FSIZE, &_before);
-    std::signal(SIGXFSZ, _handler);
-  }
-  FileSizeLimit(const FileSizeLimit&) = delete;
-  FileSizeLimit& operator=(const FileSizeLimit&) = delete;
-
- private:
-  rlimit _before{};
-  void (*_handler)(int);
-};
 
 }  // namespace
 
@@ -78,7 +57,7 @@ TEST_F(FilesTest, LeavesNoPartOfWhatDoesNotFit) {
   appendToFile(file, "1234\n");
   std::string error;
   {
-    const FileSizeLimit limit(8);
+    const test::FileSizeLimit limit(8);
     error = errorOf([&] { appendToFile(file, "123456\n"); });
   }
   EXPECT_THAT(error, HasSubstr(file.string()));
