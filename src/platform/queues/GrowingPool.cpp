@@ -3,7 +3,7 @@
 #include <csignal>
 
 #include <asio/io_context.hpp>
-#include <system_error>
+#include <exception>
 
 namespace tallyd::platform {
 
@@ -37,8 +37,8 @@ GrowingPool::~GrowingPool() { stop(); }
 void GrowingPool::start() {
   const std::lock_guard lock(_mutex);
   if (_started) return;
-  _started = true;
   while (_running < _wanted) startThread();
+  _started = true;
 }
 
 void GrowingPool::stop() {
@@ -76,8 +76,8 @@ bool GrowingPool::beginBlocking() {
       } else {
         try {
           startThread();
-        } catch (const std::system_error&) {
-          // No thread to be had: the others go on alone until this one is back.
+        } catch (const std::exception&) {
+          // No thread to be had, or no memory for it: the others go on alone until this one is back.
         }
       }
     }

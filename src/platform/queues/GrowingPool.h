@@ -19,8 +19,8 @@ namespace tallyd::platform {
 /// long as it does, and the surplus parks afterwards.
 ///
 /// Bounds: as many threads as `threads` and blocked calls together, and kMaximumParked spare ones, which
-/// leave after kSpareLife without work. A machine that gives no further thread makes the pool narrower, not
-/// an error. Threading: any thread; stop() and the destructor not on a thread of the pool.
+/// leave after kSpareLife without work. A machine that gives no stand-in, or no memory for one, makes the
+/// pool narrower, not an error. Threading: any thread; stop() and the destructor not on a thread of the pool.
 class GrowingPool {
  public:
   static constexpr std::size_t kMaximumParked = 8;  ///< More is cheaper to start anew than to keep.
@@ -32,7 +32,8 @@ class GrowingPool {
   GrowingPool(const GrowingPool&) = delete;
   GrowingPool& operator=(const GrowingPool&) = delete;
 
-  /// Starts the threads; only the first call does anything.
+  /// Starts the threads; once all have been started, a further call does nothing. Throws std::system_error or
+  /// std::bad_alloc when one can't be.
   void start();
   /// Ends the loop and joins every thread.
   void stop();
