@@ -22,13 +22,32 @@ bool isNumber(std::string_view text) {
   return !text.empty() && text.find_first_not_of("0123456789") == std::string_view::npos;
 }
 
+/// All three forms of a date begin with the day's name (RFC 9110, section 5.6.7). libcurl takes many more,
+/// such as the digits of "-20260115".
+bool beginsLikeADate(std::string_view text) {
+  return !text.empty() && ((text[0] >= 'A' && text[0] <= 'Z') || (text[0] >= 'a' && text[0] <= 'z'));
+}
+
 /// A number that does not fit counts as the longest time.
-milliseconds secondsOf(std::string_view digits, milliseconds longest) {
+seconds secondsOf(std::string_view digits) {
   std::int64_t number = 0;
   const auto parsed = std::from_chars(digits.data(), digits.data() + digits.size(), number);
-  const auto most = std::chrono::ceil<seconds>(longest).count();
-  if (parsed.ec != std::errc()) return longest;
-  return std::min<milliseconds>(seconds(std::min<std::int64_t>(number, most)), longest);
+  return parsed.ec == std::errc() ? seconds(number) : seconds::max();
+}
+
+/// Until the server's date, which is negative when that has passed. Years that no TimePoint holds are no
+/// trouble in whole seconds.
+std::optional<seconds> secondsUntil(const std::string& date, TimePoint now) {
+  if (!beginsLikeADate(date)) return std::nullopt;
+  const std::time_t time = curl_getdate(date.c_str(), nullptr);
+  if (time == -1) return std::nullopt;
+  return seconds(time) - std::chrono::floor<seconds>(now.time_since_epoch());
+}
+
+/// Compares in whole seconds: not each of them can be said in milliseconds.
+milliseconds clamped(seconds wait, milliseconds longest) {
+  if (wait < seconds(0)) return milliseconds(0);
+  return wait > std::chrono::floor<seconds>(longest) ? longest : wait;
 }
 
 milliseconds backoffRange(unsigned retries, const RetryLimits& limits) {
@@ -59,13 +78,9 @@ std::optional<milliseconds> retryAfter(const HTTPResult& result, TimePoint now, 
   if (status != kTooManyRequests && status != kServiceUnavailable) return std::nullopt;
   const auto header = result.response->header("Retry-After");
   if (!header) return std::nullopt;
-  if (isNumber(*header)) return secondsOf(*header, longest);
-  const std::time_t date = curl_getdate(header->c_str(), nullptr);
-  if (date == -1) return std::nullopt;
-  // Seconds, which no date overflows.
-  const auto wait = seconds(date) - std::chrono::floor<seconds>(now.time_since_epoch());
-  return std::clamp<milliseconds>(std::clamp<seconds>(wait, seconds(0), std::chrono::ceil<seconds>(longest)),
-                                  milliseconds(0), longest);
+  const auto wait = isNumber(*header) ? secondsOf(*header) : secondsUntil(*header, now);
+  if (!wait) return std::nullopt;
+  return clamped(*wait, longest);
 }
 
 std::optional<milliseconds> decideRetry(const HTTPResult& result, const FailedAttempt& attempt, double draw,

@@ -37,6 +37,8 @@ struct FailedAttempt {
 
 /// What "Retry-After" asks for (RFC 9110, section 10.2.3), as a number of seconds or a date: at least 0, at
 /// most `longest`. Nothing without the header, when it is neither, and with other statuses than 429 and 503.
+///
+/// @param longest  at least 0.
 [[nodiscard]] std::optional<std::chrono::milliseconds> retryAfter(const HTTPResult& result, TimePoint now,
                                                                   std::chrono::milliseconds longest);
 

@@ -66,10 +66,21 @@ TEST(RetryPolicyTest, ClampsWhatTheServerAsksFor) {
   EXPECT_EQ(retryAfter(answer(503, "Fri, 31 Dec 9999 23:59:59 GMT"), kNoon, 900s), 900s);
 }
 
+TEST(RetryPolicyTest, ClampsToTheLongestTimeThereIs) {
+  for (const char* text : {"9223372036854775807", "9223372036854776", "99999999999999999999999999"}) {
+    EXPECT_EQ(retryAfter(answer(503, text), kNoon, milliseconds::max()), milliseconds::max()) << text;
+  }
+  EXPECT_EQ(retryAfter(answer(503, "9223372036854775"), kNoon, milliseconds::max()), 9'223'372'036'854'775s);
+  EXPECT_EQ(retryAfter(answer(503, "Thu, 15 Jan 2026 12:00:01 GMT"), kNoon, milliseconds::max()), 1s);
+  EXPECT_EQ(retryAfter(answer(503, "1"), kNoon, 999ms), 999ms);
+  EXPECT_EQ(retryAfter(answer(503, "1"), kNoon, 0ms), 0ms);
+}
+
 TEST(RetryPolicyTest, IgnoresARetryAfterThatSaysNothing) {
   EXPECT_EQ(retryAfter(answer(503), kNoon, 900s), std::nullopt);
   EXPECT_EQ(retryAfter(failure(), kNoon, 900s), std::nullopt);
-  for (const char* text : {"soon", "-5", "1.5", "7 seconds", "Thu, 99 Jan"}) {
+  for (const char* text : {"soon", "-5", "1.5", "7 seconds", "Thu, 99 Jan", "-20260115", "20260115.5",
+                           "2026-01-15T12:01:30Z", " "}) {
     EXPECT_EQ(retryAfter(answer(503, text), kNoon, 900s), std::nullopt) << text;
   }
 }
