@@ -22,6 +22,9 @@ inline constexpr std::size_t kSanitizersShare = 10;
 inline constexpr std::size_t kSanitizersShare = 1;
 #endif
 
+/// A name that no resolver asks anybody about: a label has at most 63 octets (RFC 1035, section 2.3.4).
+inline const std::string kUnresolvableHost = std::string(64, 'x') + ".example";
+
 class FaultFixture : public InspectionFixture {
  protected:
   /// What the books say about the posts of all sessions, once nothing is under way any more.

@@ -8,7 +8,7 @@
 
 #include "fakes/FakePlatform.h"
 #include "fakes/SignedStorebag.h"
-#include "faults/FaultFixture.h"
+#include "faults/StorebagFaultFixture.h"
 #include "platform/http/CurlHTTPClient.h"
 #include "platform/queues/AsioQueues.h"
 #include "storebag/StorebagCache.h"
@@ -19,49 +19,7 @@ namespace {
 
 using platform::Dictionary;
 
-/// A storebag server that behaves for "playhall" (client type 5) and misbehaves for "vitrine" (6).
-class StorebagFaultTest : public FaultFixture {
- protected:
-  void useServer(const TLSServer& server) {
-    _baseURL = server.url("/bags");
-    root.setPreferences("com.quillon.tally",
-                        {{"tally_storebag_url", _baseURL}, {"httpsPostURL", collector.url("/events")}});
-  }
-  TLSServer::Script serveWith(TLSServer::Script misbehave) {
-    const std::string good = httpText(storebags.signedBag(
-        Dictionary{{"version", "1.0"}, {"release", storebagWithHTTPSPost()}}, "max-age=600"));
-    return [good, misbehave = std::move(misbehave)](TLSConnection& connection) {
-      const std::string request = connection.readRequest();
-      if (request.find("/playhall?") == std::string::npos) return misbehave(connection);
-      connection.write(good);
-      connection.close();
-    };
-  }
-  /// A session that gets no storebag: it has no backend, and its message is booked as dropped for that.
-  void expectNoStorebag(TestDaemon& daemon) {
-    TallyInspection inspection(inspectionSocket());
-    {
-      auto session = daemon.connect();
-      session->setSessionInfoSync(sessionInfo(7, 6), std::nullopt);
-      EXPECT_EQ(session->startConfigSync().value, std::nullopt);
-      EXPECT_EQ(session->sendMessageSync(kMethod, 0, Dictionary{{"a", 1}}).value, std::nullopt);
-    }
-    EXPECT_EQ(linesWith(daemon, "<2>Unable to fetch storebag for client type 6", "", 1), 1U);
-    const Dictionary stats = statsWhen(inspection, nothingUnderWay);
-    const Dictionary& messages = *stats.dictionary("total")->dictionary("messages");
-    EXPECT_EQ(number(messages, "accepted"), 1);
-    EXPECT_EQ(number(*messages.dictionary("dropped"), "no-backends"), 1);
-  }
-  void expectOthersServed(TestDaemon& daemon) {
-    auto session = daemon.connect();
-    session->setSessionInfoSync(sessionInfo(8), Dictionary{{"ClientName", "demo"}});
-    EXPECT_EQ(session->startConfigSync().value, std::vector<std::string>{"splunk"});
-    EXPECT_TRUE(collector.waitForRequests(1));
-  }
-
- private:
-  std::string _baseURL;
-};
+class StorebagFaultTest : public StorebagFaultFixture {};
 
 TEST_F(StorebagFaultTest, DelaysNobodyWhileAServerHangs) {
   std::promise<void> answered;
@@ -82,10 +40,9 @@ TEST_F(StorebagFaultTest, DelaysNobodyWhileAServerHangs) {
 }
 
 TEST_F(StorebagFaultTest, TakesNoHalfOfABody) {
-  const std::string whole = httpText(storebags.signedBag(
-      Dictionary{{"version", "1.0"}, {"release", storebagWithHTTPSPost()}}, "max-age=600"));
+  const std::string half = brokenOffText();
   const TLSServer server(loopbackIdentity(storebags.authority()), serveWith([&](TLSConnection& connection) {
-                           connection.write(whole.substr(0, whole.size() - 200));
+                           connection.write(half);
                            connection.close();
                          }));
   useServer(server);
@@ -96,12 +53,8 @@ TEST_F(StorebagFaultTest, TakesNoHalfOfABody) {
 
 TEST_F(StorebagFaultTest, BoundsTheMemoryThatABodyOfAGibibyteTakes) {
   std::atomic<std::size_t> written = 0;
-  const TLSServer server(loopbackIdentity(storebags.authority()), serveWith([&](TLSConnection& connection) {
-                           connection.write("HTTP/1.1 200 OK\r\nContent-Length: 1073741824\r\n\r\n");
-                           const std::string piece(1U << 20U, 'x');
-                           while (written < (std::size_t{1} << 30U) && connection.writeAll(piece))
-                             written += piece.size();
-                         }));
+  const TLSServer server(loopbackIdentity(storebags.authority()),
+                         serveWith([&](TLSConnection& connection) { writeGibibyte(connection, written); }));
   useServer(server);
   TestDaemon daemon(root);
   expectOthersServed(daemon);
@@ -114,9 +67,7 @@ TEST_F(StorebagFaultTest, BoundsTheMemoryThatABodyOfAGibibyteTakes) {
 }
 
 TEST_F(StorebagFaultTest, TakesNoBagThatAnotherKeyHasSigned) {
-  const std::string forged = httpText({.body = fakes::StorebagSigner::stranger().envelope(Dictionary{
-                                           {"version", "1.0"}, {"release", storebagWithHTTPSPost()}}),
-                                       .headers = {{"Cache-Control", "max-age=600"}}});
+  const std::string forged = forgedText();
   const TLSServer server(loopbackIdentity(storebags.authority()),
                          serveWith([&](TLSConnection& connection) { connection.write(forged); }));
   useServer(server);

@@ -170,6 +170,7 @@ TestDaemon::TestDaemon(const TestRoot& root, const Options& options) : _root(roo
   process.descriptorLimit = options.descriptorLimit;
   process.passedSocket = options.passedSocket;
   process.limits = options.limits;
+  process.umask = options.umask;
   _process = std::make_unique<WatchedProcess>(process);
   EXPECT_TRUE(readiness.wait()) << "the daemon is not ready:\n" << _process->output();
 }

@@ -74,6 +74,7 @@ class TestDaemon {
     std::optional<int> descriptorLimit{};
     int passedSocket = -1;
     std::map<int, std::size_t> limits{};  ///< As WatchedProcess takes them.
+    std::optional<mode_t> umask{};
   };
 
   explicit TestDaemon(const TestRoot& root) : TestDaemon(root, Options()) {}

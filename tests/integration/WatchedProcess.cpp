@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/resource.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 
 #include <algorithm>
@@ -73,6 +74,7 @@ std::vector<std::string> mergedEnvironment(const std::map<std::string, std::stri
     const rlimit limit{value, value};
     setrlimit(static_cast<__rlimit_resource>(resource), &limit);
   }
+  if (options.umask) ::umask(*options.umask);
   execve(arguments[0], arguments, environment);
   _exit(127);
 }

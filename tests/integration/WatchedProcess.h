@@ -38,6 +38,7 @@ class WatchedProcess {
     std::optional<int> descriptorLimit{};  ///< RLIMIT_NOFILE.
     std::map<int, std::size_t> limits{};  ///< Other resource limits (setrlimit(2)): RLIMIT_… and its value.
     int passedSocket = -1;                ///< Becomes descriptor 3, as a service manager passes it.
+    std::optional<mode_t> umask{};        ///< The test's own otherwise.
   };
 
   explicit WatchedProcess(const Options& options);

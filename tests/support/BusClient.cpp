@@ -237,6 +237,11 @@ std::size_t BusClient::writeSome(std::string_view bytes) const {
   return sent > 0 ? static_cast<std::size_t>(sent) : 0;
 }
 
+void BusClient::waitForRoom(std::chrono::milliseconds time) const {
+  pollfd ready{.fd = _socket.get(), .events = POLLOUT, .revents = 0};
+  ::poll(&ready, 1, static_cast<int>(time.count()));
+}
+
 void BusClient::awaitAnswer(std::uint32_t serial) {
   while (true) {
     const auto size = messageSize(_received);

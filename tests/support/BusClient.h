@@ -54,6 +54,8 @@ class BusClient {
   void write(std::string_view bytes) const;
   /// Writes what is taken without waiting; how many bytes that was.
   [[nodiscard]] std::size_t writeSome(std::string_view bytes) const;
+  /// Waits until there is room to write, or until this time has passed.
+  void waitForRoom(std::chrono::milliseconds time) const;
   /// Waits for the answer of this call; an answer that is an error throws.
   void awaitAnswer(std::uint32_t serial);
   /// Waits until the daemon closes the connection; what it sent before is passed over. False after kPatience.

@@ -62,18 +62,28 @@ struct TLSServer::Context {
 };
 
 TLSServer::TLSServer(const signing::TLSIdentity& identity, Script script)
-    : _context(std::make_unique<Context>(identity)),
-      _server(std::make_unique<RawServer>(
-          [context = _context->tls, script = std::move(script)](RawConnection& connection) {
-            try {
-              TLSConnection secured(connection, context);
-              script(secured);
-            } catch (const std::runtime_error&) {
-              // The client wants nothing of this server: what the test sees is its side.
-            }
-          })) {}
+    : _context(std::make_shared<const Context>(identity)),
+      _server(std::make_unique<RawServer>([this, script = std::move(script)](RawConnection& connection) {
+        try {
+          TLSConnection secured(connection, context()->tls);
+          script(secured);
+        } catch (const std::runtime_error&) {
+          // The client wants nothing of this server: what the test sees is its side.
+        }
+      })) {}
 
 TLSServer::~TLSServer() = default;
+
+void TLSServer::setIdentity(const signing::TLSIdentity& identity) {
+  auto context = std::make_shared<const Context>(identity);
+  const std::lock_guard lock(_mutex);
+  _context = std::move(context);
+}
+
+std::shared_ptr<const TLSServer::Context> TLSServer::context() const {
+  const std::lock_guard lock(_mutex);
+  return _context;
+}
 
 std::string TLSServer::url(const std::string& path) const { return "https" + _server->url(path).substr(4); }
 

@@ -3,6 +3,7 @@
 
 #include <functional>
 #include <memory>
+#include <mutex>
 #include <string>
 #include <string_view>
 
@@ -49,12 +50,18 @@ class TLSServer {
   TLSServer(const TLSServer&) = delete;
   TLSServer& operator=(const TLSServer&) = delete;
 
+  /// What connections from now on are shown.
+  void setIdentity(const signing::TLSIdentity& identity);
+
   [[nodiscard]] std::string url(const std::string& path = "/") const;
   [[nodiscard]] int connectionCount() const { return _server->connectionCount(); }
 
  private:
   struct Context;
-  const std::unique_ptr<Context> _context;
+  [[nodiscard]] std::shared_ptr<const Context> context() const;
+
+  mutable std::mutex _mutex;
+  std::shared_ptr<const Context> _context;
   std::unique_ptr<RawServer> _server;
 };
 
