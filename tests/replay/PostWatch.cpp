@@ -28,6 +28,10 @@ bool mayEndOtherwise(const HTTPResult& result) {
 
 bool isRefusal(const HTTPResult& result) { return !result.error && result.response->status >= 400; }
 
+bool isWithdrawn(const HTTPResult& result) {
+  return result.error && result.failure == platform::HTTPFailure::Withdrawn;
+}
+
 bool areAlike(const HTTPResult& one, const HTTPResult& other) {
   if (one.error || other.error) return one.error == other.error && one.failure == other.failure;
   return one.response->status == other.response->status;
@@ -70,7 +74,7 @@ std::optional<platform::RetryLimits> retryLimitsOf(const OptIns& optIns) {
 PostWatch::PostWatch(Surroundings& surroundings)
     : _world(surroundings),
       _retries(retryLimitsOf(surroundings.optIns)),
-      _mayBeStopped(mayStopFurtherAttempts(surroundings.optIns)) {}
+      _asksForConsent(surroundings.optIns.consentChecks == ConsentChecks::BeforeEachPost) {}
 
 std::uint64_t PostWatch::numberOf(const HTTPRequest& request) {
   return static_cast<std::uint64_t>(platform::leadingInteger(header(request, kNumberHeader)));
@@ -80,6 +84,7 @@ void PostWatch::begin(HTTPRequest& request) {
   const std::size_t events = takeDocument(request);
   ++_world.received.postsUnderWay;
   _world.received.eventsUnderWay += events;
+  if (request.mayBeSentAgain && !_asksForConsent) _world.violated("a post asks for consent unasked");
   request.headers.emplace_back(kNumberHeader, std::to_string(++_lastNumber));
   _posts.emplace(_lastNumber, Post{_world.queues.now(), events, request.body});
 }
@@ -130,6 +135,8 @@ void PostWatch::checkFurtherAttempt(const Post& post, const HTTPRequest& request
   if (now < post.ended + post.asked) _world.violated("a post was tried again before the server wanted it");
   if (_retries && now > post.begun + _retries->totalTime) _world.violated("a post was tried again too late");
   if (request.body.bytes() != post.body.bytes()) _world.violated("a further attempt had another body");
+  if (request.mayBeSentAgain && !_world.hasConsent)
+    _world.violated("a post was tried again after consent had gone");
 }
 
 void PostWatch::attempted(const HTTPRequest& request, const HTTPResult& result,
@@ -153,7 +160,11 @@ void PostWatch::end(std::uint64_t number, const HTTPResult& result) {
 void PostWatch::checkEnd(const Post& post, const HTTPResult& result) {
   if (post.attempts == 0) return _world.violated("a post ended that was never tried");
   if (post.isUnderWay) _world.violated("a post ended while an attempt was under way");
-  if (_mayBeStopped && mayEndOtherwise(post.last)) return;
+  if (isWithdrawn(result)) {
+    if (!_asksForConsent || !mayEndOtherwise(post.last))
+      _world.violated("a post was stopped without a cause");
+    return;
+  }
   if (!areAlike(result, post.last))
     _world.violated("the daemon heard another result than the last attempt's");
   if (mustBeTriedAgain(post)) _world.violated("a post was given up too early");
@@ -171,8 +182,8 @@ void PostWatch::count(const Post& post, const HTTPResult& result) {
   Received& received = _world.received;
   --received.postsUnderWay;
   received.eventsUnderWay -= post.events;
-  if (_mayBeStopped && mayEndOtherwise(post.last)) {
-    received.eventsUncertain += post.events;
+  if (isWithdrawn(result)) {
+    received.eventsWithdrawn += post.events;
   } else if (result.error) {
     const bool foundNoRoom = result.failure == platform::HTTPFailure::TooMuchWaits;
     (foundNoRoom ? received.eventsWithoutRoom : received.eventsFailed) += post.events;

@@ -56,8 +56,7 @@ class PostWatch {
 
   Surroundings& _world;
   const std::optional<platform::RetryLimits> _retries;
-  /// A further attempt may be stopped for consent that was withdrawn: from outside that can't be told.
-  const bool _mayBeStopped;
+  const bool _asksForConsent;  ///< Before each further attempt, where there was consent at first.
   std::uint64_t _lastNumber = 0;
   std::map<std::uint64_t, Post> _posts;
 };

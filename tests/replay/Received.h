@@ -26,7 +26,7 @@ struct Received {
   std::uint64_t eventsRefused = 0;
   std::uint64_t eventsFailed = 0;
   std::uint64_t eventsWithoutRoom = 0;
-  std::uint64_t eventsUncertain = 0;  ///< Whether their post was given up or stopped is not known outside.
+  std::uint64_t eventsWithdrawn = 0;  ///< Their post failed, and consent had gone before it was tried again.
   // Requests that a session waits for.
   std::uint64_t fetches = 0;
   std::uint64_t fetchesFailed = 0;

@@ -222,7 +222,7 @@ TEST(ReplayOptInTest, TriesPostsAgainOnlyWhereThatIsAskedFor) {
   EXPECT_EQ(outcome.violationCount, 0U) << violationsOf(outcome, day);
   EXPECT_GT(outcome.received.furtherAttempts, 0U);
   EXPECT_GT(outcome.received.eventsSaved, 0U);
-  EXPECT_EQ(outcome.received.eventsUncertain, 0U);
+  EXPECT_EQ(outcome.received.eventsWithdrawn, 0U);
 
   Scenario plain = day;
   plain.optIns.retryPosts = 0;
@@ -230,6 +230,26 @@ TEST(ReplayOptInTest, TriesPostsAgainOnlyWhereThatIsAskedFor) {
   EXPECT_EQ(withoutRetries.violationCount, 0U);
   EXPECT_GT(withoutRetries.received.eventsFailed, 0U);
   EXPECT_EQ(withoutRetries.received.furtherAttempts, 0U);
+}
+
+TEST(ReplayOptInTest, StopsFurtherAttemptsForWithdrawnConsent) {
+  Scenario day = firstDay(
+      hours(6), [](const OptIns& optIns) { return optIns.retryPosts > 1 && rereadsConsent(optIns); });
+  day.recipe.reset();
+  std::erase_if(day.steps,
+                [](const Step& step) { return std::holds_alternative<ChangeWeather>(step.happening); });
+  day.steps.push_back({seconds(0), 0, ChangeWeather{{.postFails = 1}}});
+  constexpr seconds kPeriod{20};
+  for (seconds at{0}; at < day.length; at += kPeriod) {
+    const bool consents = at / kPeriod % 2 == 0;
+    day.steps.push_back({at, 0, SetPreference{"com.quillon.diagnostics", kConsentKey, consents}});
+  }
+  std::stable_sort(day.steps.begin(), day.steps.end(),
+                   [](const Step& one, const Step& other) { return one.at < other.at; });
+  const Outcome outcome = simulate(day);
+  EXPECT_EQ(outcome.violationCount, 0U) << violationsOf(outcome, day);
+  EXPECT_GT(outcome.received.furtherAttempts, 0U);
+  EXPECT_GT(outcome.received.eventsWithdrawn, 0U);
 }
 
 TEST(ReplayOptInTest, StopsPostsForWithdrawnConsentOnlyWhereItIsReadAgain) {

@@ -174,14 +174,14 @@ std::string summary(const Outcome& outcome) {
   const Received& received = outcome.received;
   std::string text = fmt::format(
       "{} sessions, {} calls, {} storebag fetches ({} failed), {} posts with {} events ({} refused, {} "
-      "failed, {} uncertain, {} saved by {} further attempts), "
+      "failed, {} withdrawn, {} saved by {} further attempts), "
       "{} datagrams and {} reliable ones ({} retransmissions, {} acknowledged), {} uploads ({} failed), "
       "{} log data, {} power records, {} adaptor messages, {} message logs deleted, {} lines of trace; "
       "dropped:",
       outcome.connections, outcome.calls, received.fetches, received.fetchesFailed, received.posts,
       received.eventsTaken + received.eventsRefused + received.eventsFailed + received.eventsWithoutRoom +
-          received.eventsUncertain,
-      received.eventsRefused, received.eventsFailed + received.eventsWithoutRoom, received.eventsUncertain,
+          received.eventsWithdrawn,
+      received.eventsRefused, received.eventsFailed + received.eventsWithoutRoom, received.eventsWithdrawn,
       received.eventsSaved, received.furtherAttempts, received.plainDatagrams, received.reliableDatagrams,
       received.retransmissions, received.acknowledged, received.uploads + received.uploadsFailed,
       received.uploadsFailed, received.logData, received.powerRecords, received.adaptorMessages,
