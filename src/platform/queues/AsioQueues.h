@@ -19,6 +19,7 @@ class Log;
 /// An exception that leaves a piece of work ends the process; with a log, it costs that piece and a critical
 /// line, and everything else goes on. Memory for the loop's own records of events, of some hundred bytes,
 /// must be there: without it an event would never be heard of, and the process ends, after a critical line.
+/// So must the last few bytes of a new queue: Asio's strand does not outlive a want of them.
 ///
 /// Life cycle: the destructor stops and joins the threads and drops the work that has not started. The queues
 /// and sources made here must be gone by then, but for those that only queued work and handlers hold.

@@ -2,12 +2,15 @@
 
 #include <gtest/gtest.h>
 
+#include <asio/executor_work_guard.hpp>
+#include <asio/io_context.hpp>
 #include <memory>
 #include <new>
 #include <thread>
 
 #include "Gate.h"
 #include "platform/queues/AsioQueues.h"
+#include "platform/queues/GrowingPool.h"
 #include "support/FailingAllocation.h"
 
 namespace tallyd::platform {
@@ -49,22 +52,25 @@ TEST(PoolMemoryTest, ABlockingCallGoesOnWithoutAStandInForWhichThereIsNoMemory) 
   }
 }
 
-TEST(PoolMemoryTest, StartsTheThreadsForWhichThereWasNoMemoryWithTheNextQueue) {
+TEST(PoolMemoryTest, StartsTheThreadsForWhichThereWasNoMemoryTheNextTime) {
   constexpr std::size_t kThreads = 3;
   for (int number = 1;; ++number) {
-    AsioQueues queues(kThreads);
-    std::shared_ptr<SerialQueue> queue;
+    asio::io_context loop;
+    const auto work = asio::make_work_guard(loop);
+    GrowingPool pool(loop, kThreads);
+    bool failed = true;
     try {
       const OneFailingAllocation failing(std::this_thread::get_id(), number);
-      queue = queues.makeSerialQueue("test");
+      pool.start();
+      failed = failing.hasFailed();
     } catch (const std::bad_alloc&) {
     }
-    if (queue) {
+    pool.start();
+    EXPECT_EQ(pool.threadCount(), kThreads) << "allocation " << number;
+    if (!failed) {
       EXPECT_GT(number, 1);
       return;
     }
-    queue = queues.makeSerialQueue("test");
-    EXPECT_EQ(queues.threadCount(), kThreads) << "allocation " << number;
   }
 }
 
