@@ -64,7 +64,8 @@ class ExportedObject {
 /// One client's connection, seen from the service.
 ///
 /// Set it up, then resume it; calls, interruption and invalidation arrive on the connection's own serial
-/// queue. It lives until it is invalidated and nobody holds it.
+/// queue. Who the client is may be asked before that, and on that queue. It lives until it is invalidated and
+/// nobody holds it.
 class ServiceConnection {
  public:
   virtual ~ServiceConnection() = default;

@@ -157,9 +157,10 @@ class TestService final : public ListenerDelegate {
     connection->setExportedObject(std::make_shared<TestObject>(events));
     connection->setInterruptionHandler([this] { events.add("interrupted"); });
     connection->setInvalidationHandler([this] { events.add("invalidated"); });
+    const std::string description = connection->description();
     connection->resume();
     events.add("accepted");
-    events.add(connection->description());
+    events.add(description);
     return true;
   }
 
