@@ -274,15 +274,14 @@ class ValueBuilder : public rapidjson::BaseReaderHandler<rapidjson::UTF8<>, Valu
   bool Bool(bool value) { return add(Value(value)); }
   bool RawNumber(const char* text, rapidjson::SizeType length, bool /*copy*/) {
     auto value = valueOfNumber({text, length});
-    _isTooBig = !value;
-    return value && add(*std::move(value));
+    return value ? add(*std::move(value)) : refuse(rapidjson::kParseErrorNumberTooBig);
   }
   bool String(const char* text, rapidjson::SizeType length, bool /*copy*/) {
-    return add(Value(std::string(text, length)));
+    return isText({text, length}) && add(Value(std::string_view(text, length)));
   }
   bool Key(const char* text, rapidjson::SizeType length, bool /*copy*/) {
     _open.back().key.assign(text, length);
-    return true;
+    return isText({text, length});
   }
   bool StartObject() { return open(Kind::Object); }
   bool StartArray() { return open(Kind::Array); }
@@ -298,7 +297,8 @@ class ValueBuilder : public rapidjson::BaseReaderHandler<rapidjson::UTF8<>, Valu
   }
 
   Value takeRoot() { return std::move(_root); }
-  [[nodiscard]] bool isTooBig() const { return _isTooBig; }  ///< Why the builder refused, if not for nesting.
+  /// Why the builder refused, if not for nesting.
+  [[nodiscard]] std::optional<rapidjson::ParseErrorCode> refusal() const { return _refusal; }
 
  private:
   enum class Kind { Object, Array };
@@ -310,6 +310,16 @@ class ValueBuilder : public rapidjson::BaseReaderHandler<rapidjson::UTF8<>, Valu
     std::string key;
     Kind kind;
   };
+
+  bool refuse(rapidjson::ParseErrorCode reason) {
+    _refusal = reason;
+    return false;
+  }
+
+  /// The reader sees to the text's encoding, and lets the second half of a surrogate pair stand alone.
+  bool isText(std::string_view text) {
+    return isUTF8(text) || refuse(rapidjson::kParseErrorStringUnicodeSurrogateInvalid);
+  }
 
   bool open(Kind kind) {
     if (_open.size() >= kMaximumValueDepth) return false;
@@ -330,7 +340,7 @@ class ValueBuilder : public rapidjson::BaseReaderHandler<rapidjson::UTF8<>, Valu
 
   std::vector<Open> _open;
   Value _root;
-  bool _isTooBig = false;
+  std::optional<rapidjson::ParseErrorCode> _refusal;
 };
 
 std::string errorText(rapidjson::ParseErrorCode code, std::size_t offset) {
@@ -359,7 +369,7 @@ JSONResult valueFromJSON(std::string_view text) {
   rapidjson::Reader reader;
   ValueBuilder builder;
   if (!reader.Parse<kFlags>(stream, builder)) {
-    const auto code = builder.isTooBig() ? rapidjson::kParseErrorNumberTooBig : reader.GetParseErrorCode();
+    const auto code = builder.refusal().value_or(reader.GetParseErrorCode());
     return {std::nullopt, errorText(code, skipped + reader.GetErrorOffset())};
   }
   // The reader takes a NUL byte for the end.

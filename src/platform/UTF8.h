@@ -74,6 +74,16 @@ inline std::size_t asciiLength(std::string_view text) {
   return length;
 }
 
+inline bool isUTF8(std::string_view text) {
+  while (true) {
+    text.remove_prefix(asciiLength(text));
+    if (text.empty()) return true;
+    const UTF8Sequence sequence = firstUTF8Sequence(text);
+    if (!sequence.wellFormed) return false;
+    text.remove_prefix(sequence.length);
+  }
+}
+
 /// `text` with every broken sequence replaced by U+FFFD.
 inline std::string withBrokenUTF8Replaced(std::string_view text) {
   std::string result;

@@ -38,15 +38,6 @@ class SandboxExtension {
   const platform::Sandbox::ExtensionHandle _handle;
 };
 
-bool isUTF8(std::string_view text) {
-  while (!text.empty()) {
-    const platform::UTF8Sequence sequence = platform::firstUTF8Sequence(text);
-    if (!sequence.wellFormed) return false;
-    text.remove_prefix(sequence.length);
-  }
-  return true;
-}
-
 }  // namespace
 
 std::shared_ptr<UploadBackend> UploadBackend::initWithName(const platform::Platform& platform,
@@ -141,7 +132,7 @@ void UploadBackend::post(const std::string& path, const std::string& url, std::s
 }
 
 void UploadBackend::takeAnswer(const std::string& path, std::string_view answer) const {
-  const bool isText = isUTF8(answer);
+  const bool isText = platform::isUTF8(answer);
   asl_log(_platform.log, LogLevel::Debug, "Tally(uploadFileAtPath): sending to |{}|, Json output: {}",
           *_uploadURL, isText ? answer : "(null)");
   if (isText && answer.find(kSuccess) != std::string_view::npos) ::unlink(path.c_str());

@@ -149,8 +149,10 @@ TEST(JSONTest, NamesTheErrorAndItsPlace) {
             "The document root must not be followed by other values. (at byte 3)");
   EXPECT_EQ(error("\"a"), "Missing a closing quotation mark in string. (at byte 2)");
   EXPECT_NE(error("\"\xFF\"").find("Invalid encoding"), std::string::npos);
-  for (const char* text :
-       {"{", "{\"a\"}", "{1:2}", "nul", "01", "NaN", "'a'", "[1 2]", "\"\\ud800\"", "1e999"}) {
+  for (const char* lone : {R"("\udc00")", R"({"a\ude00":1})", R"("\ud800")", R"("\ud800\ud800")"}) {
+    EXPECT_EQ(error(lone).substr(0, 40), "The surrogate pair in string is invalid.") << lone;
+  }
+  for (const char* text : {"{", "{\"a\"}", "{1:2}", "nul", "01", "NaN", "'a'", "[1 2]", "1e999"}) {
     EXPECT_NE(error(text), "");
   }
 }

@@ -61,5 +61,14 @@ TEST(UTF8Test, CutsBetweenTwoCharacters) {
   }
 }
 
+TEST(UTF8Test, TellsWhatIsUTF8) {
+  for (const char* text : {"", "plain text that is longer than a word", "é€😀", "words before é and behind"}) {
+    EXPECT_TRUE(isUTF8(text)) << text;
+  }
+  for (const char* text : {"\xFF", "a\xC3", "words before \xED\xA0\x80", "\xED\xB8\x80 and behind them"}) {
+    EXPECT_FALSE(isUTF8(text));
+  }
+}
+
 }  // namespace
 }  // namespace tallyd::platform
