@@ -362,7 +362,7 @@ platform::HTTPRequest HTTPSPostBackend::requestFor(const std::string& json) cons
   request.headers.emplace_back("Accept", "application/json");
   request.headers.emplace_back("Content-Type", "application/json");
   const bool plain = !compressed || compressed->size() >= json.size();
-  request.body = platform::Data(plain ? json : std::move(*compressed));
+  request.body = plain ? platform::Data(json) : platform::Data(std::move(*compressed));
   request.headers.emplace_back("Content-Length", std::to_string(request.body.size()));
   if (!plain) request.headers.emplace_back("Content-Encoding", "gzip");
   if (_consentWatch) request.mayBeSentAgain = [watch = _consentWatch] { return !watch->isWithdrawn(); };

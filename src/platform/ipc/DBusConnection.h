@@ -35,7 +35,7 @@ struct MessageFields;
 class DBusConnection : public std::enable_shared_from_this<DBusConnection> {
  public:
   static constexpr std::size_t kMaximumQueuedMessages = 256;
-  static constexpr std::size_t kMaximumQueuedBytes = 4 * 1024 * 1024;
+  static constexpr std::size_t kMaximumQueuedBytes = std::size_t{4} * 1024 * 1024;
   static constexpr std::size_t kMaximumDescriptors = 256;
   static constexpr std::chrono::seconds kAuthenticationTime{90};
   static constexpr std::chrono::seconds kPatienceAtEnd{1};
