@@ -1,12 +1,11 @@
 #include "replay/PostWatch.h"
 
-#include <zlib.h>
-
 #include <algorithm>
 #include <string>
 
 #include "platform/JSON.h"
 #include "replay/Storebags.h"
+#include "support/Gunzipped.h"
 
 namespace tallyd::replay {
 
@@ -39,7 +38,7 @@ bool areAlike(const HTTPResult& one, const HTTPResult& other) {
 
 std::string plainBody(const HTTPRequest& request) {
   const std::string_view body = request.body.bytes();
-  return header(request, "Content-Encoding") == "gzip" ? gunzipped(body) : std::string(body);
+  return header(request, "Content-Encoding") == "gzip" ? test::gunzipped(body) : std::string(body);
 }
 
 }  // namespace
@@ -49,21 +48,6 @@ std::string header(const HTTPRequest& request, std::string_view name) {
     if (key == name) return value;
   }
   return {};
-}
-
-std::string gunzipped(std::string_view compressed) {
-  constexpr int kGzip = 15 + 16;  // zlib.h: the largest window, with a gzip header.
-  std::string plain(1 << 20, '\0');
-  z_stream stream{};
-  if (inflateInit2(&stream, kGzip) != Z_OK) return {};
-  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(compressed.data()));
-  stream.avail_in = static_cast<uInt>(compressed.size());
-  stream.next_out = reinterpret_cast<Bytef*>(plain.data());
-  stream.avail_out = static_cast<uInt>(plain.size());
-  inflate(&stream, Z_FINISH);
-  plain.resize(stream.total_out);
-  inflateEnd(&stream);
-  return plain;
 }
 
 std::optional<platform::RetryLimits> retryLimitsOf(const OptIns& optIns) {

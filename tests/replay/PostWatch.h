@@ -79,7 +79,5 @@ class WatchedHTTP : public platform::HTTPClient {
 
 /// The value of a header; empty when it is missing.
 [[nodiscard]] std::string header(const platform::HTTPRequest& request, std::string_view name);
-/// What a gzip member says, up to a mebibyte.
-[[nodiscard]] std::string gunzipped(std::string_view compressed);
 
 }  // namespace tallyd::replay

@@ -6,6 +6,7 @@
 #include "fakes/SignedStorebag.h"
 #include "replay/Scenario.h"
 #include "replay/Storebags.h"
+#include "support/Gunzipped.h"
 
 namespace tallyd::replay {
 
@@ -115,7 +116,7 @@ HTTPResult SimulatedHTTP::upload(const HTTPRequest& request) {
   _world.elapse(_world.upTo(_world.weather.longestUpload));
   const bool fails = _world.draws.chance(_world.weather.uploadFails);
   const bool refused = !fails && _world.draws.chance(_world.weather.uploadIsRefused);
-  _world.trace.write("upload", "{} {} bytes: {}", request.url, gunzipped(request.body.bytes()).size(),
+  _world.trace.write("upload", "{} {} bytes: {}", request.url, test::gunzipped(request.body.bytes()).size(),
                      fails     ? "failed"
                      : refused ? "refused"
                                : "taken");

@@ -2,7 +2,6 @@
 #pragma once
 
 #include <gtest/gtest.h>
-#include <zlib.h>
 
 #include <memory>
 #include <optional>
@@ -14,29 +13,9 @@
 #include "fakes/FakePlatform.h"
 #include "framework/TallyKeys.h"
 #include "platform/JSON.h"
+#include "support/Gunzipped.h"
 
 namespace tallyd {
-
-/// The text in a gzip member that is `compressed` as a whole.
-inline std::string gunzipped(std::string_view compressed) {
-  z_stream stream{};
-  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(compressed.data()));
-  stream.avail_in = static_cast<uInt>(compressed.size());
-  EXPECT_EQ(inflateInit2(&stream, 15 + 16), Z_OK);
-  std::string text;
-  int status = Z_OK;
-  while (status == Z_OK) {
-    char piece[4096];
-    stream.next_out = reinterpret_cast<Bytef*>(piece);
-    stream.avail_out = sizeof piece;
-    status = inflate(&stream, Z_NO_FLUSH);
-    text.append(piece, sizeof piece - stream.avail_out);
-  }
-  EXPECT_EQ(status, Z_STREAM_END);
-  EXPECT_EQ(stream.avail_in, 0U);
-  inflateEnd(&stream);
-  return text;
-}
 
 /// The device consents and matches the default client entry, which lets everything through.
 class HTTPSPostBackendFixture : public testing::Test {
@@ -120,7 +99,7 @@ class HTTPSPostBackendFixture : public testing::Test {
   }
   static std::string textOf(const platform::HTTPRequest& request) {
     const std::string bytes(request.body.bytes());
-    return header(request, "Content-Encoding") == "gzip" ? gunzipped(bytes) : bytes;
+    return header(request, "Content-Encoding") == "gzip" ? test::gunzipped(bytes) : bytes;
   }
   /// The document of the last post.
   [[nodiscard]] Dictionary lastBody() const {

@@ -85,7 +85,7 @@ TEST_F(PostRequestTest, SendsGzipThatInflatesToTheReturnedDocument) {
   EXPECT_EQ(header(request, "Content-Length"), std::to_string(request.body.size()));
   ASSERT_TRUE(posted);
   EXPECT_LT(request.body.size(), posted->size());
-  EXPECT_EQ(gunzipped(request.body.bytes()), *posted);
+  EXPECT_EQ(test::gunzipped(request.body.bytes()), *posted);
 }
 
 TEST_F(PostRequestTest, SendsABodyOf100BytesPlainThatGzipWouldMakeLonger) {

@@ -1,11 +1,11 @@
 #include "backends/upload/UploadBackend.h"
 
 #include <gtest/gtest.h>
-#include <zlib.h>
 
 #include <fstream>
 
 #include "fakes/FakePlatform.h"
+#include "support/Gunzipped.h"
 
 namespace tallyd {
 namespace {
@@ -17,21 +17,6 @@ using platform::Dictionary;
 using platform::HTTPRequest;
 using platform::LogLevel;
 using Lines = std::vector<FakeLog::Line>;
-
-std::string gunzipped(std::string_view compressed) {
-  z_stream stream{};
-  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(compressed.data()));
-  stream.avail_in = static_cast<uInt>(compressed.size());
-  EXPECT_EQ(inflateInit2(&stream, 15 + 16), Z_OK);
-  std::string text(100'000, '\0');
-  stream.next_out = reinterpret_cast<Bytef*>(text.data());
-  stream.avail_out = static_cast<uInt>(text.size());
-  EXPECT_EQ(inflate(&stream, Z_FINISH), Z_STREAM_END);
-  EXPECT_EQ(stream.avail_in, 0U);
-  text.resize(stream.total_out);
-  inflateEnd(&stream);
-  return text;
-}
 
 class UploadBackendTest : public testing::Test {
  protected:
@@ -120,7 +105,7 @@ TEST_F(UploadBackendTest, PostsTheCompressedFile) {
   EXPECT_EQ(requests[0].headers,
             (std::vector<std::pair<std::string, std::string>>{{"Content-Type", "application/octet-stream"},
                                                               {"Content-Encoding", "gzip"}}));
-  EXPECT_EQ(gunzipped(requests[0].body.bytes()), "line one\nline two\n");
+  EXPECT_EQ(test::gunzipped(requests[0].body.bytes()), "line one\nline two\n");
   EXPECT_EQ(requests[0].timeout.count(), 0);
   EXPECT_EQ(requests[0].cachePolicy, platform::CachePolicy::UseProtocol);
   expectExtensionReleased();
