@@ -77,7 +77,8 @@ ParsedOptions parseDaemonOptions(int argumentCount, const char* const* arguments
       ->type_name("N")
       ->check(CLI::Range(0, kMostRetries));
   app.add_flag("--recheck-consent", recheckConsent,
-               "Read the user's consent also before each post; a withdrawal stops it");
+               "Read the user's consent also before each post and each further attempt of one; a withdrawal "
+               "stops it");
   try {
     app.parse(argumentCount, arguments);
   } catch (const CLI::ParseError& error) {
