@@ -29,7 +29,11 @@ struct ReceivedCall {
 
 class ScriptedDaemon final : public platform::ListenerDelegate {
  public:
-  explicit ScriptedDaemon(const std::filesystem::path& socketPath) : _listener(socketPath, _queues, _log) {
+  /// What it answers at first: nothing, or "text" where a text must come, else nothing or no.
+  enum class Answers { None, Fitting };
+
+  explicit ScriptedDaemon(const std::filesystem::path& socketPath, Answers answers = Answers::None)
+      : _answersFit(answers == Answers::Fitting), _listener(socketPath, _queues, _log) {
     _listener.setDelegate(*this);
     _listener.resume();
   }
@@ -42,11 +46,6 @@ class ScriptedDaemon final : public platform::ListenerDelegate {
     const std::lock_guard lock(_mutex);
     _answer.reset();
     _answersFit = false;
-  }
-  /// "text" where a text must come, else nothing or no.
-  void answerFittingly() {
-    const std::lock_guard lock(_mutex);
-    _answersFit = true;
   }
   /// The calls received, once there are `count` of them.
   std::vector<ReceivedCall> calls(std::size_t count) {
@@ -110,7 +109,7 @@ class ScriptedDaemon final : public platform::ListenerDelegate {
   std::condition_variable _changed;
   std::vector<ReceivedCall> _calls;
   std::optional<std::vector<platform::Value>> _answer;
-  bool _answersFit = false;
+  bool _answersFit;
   bool _invalidated = false;
   fakes::FakeLog _log;
   platform::AsioQueues _queues{2};

@@ -43,10 +43,7 @@ class Notes {
 
 class TallyReconnectTest : public testing::Test {
  protected:
-  void startDaemon() {
-    _daemon = std::make_unique<ScriptedDaemon>(_path);
-    _daemon->answerFittingly();
-  }
+  void startDaemon() { _daemon = std::make_unique<ScriptedDaemon>(_path, ScriptedDaemon::Answers::Fitting); }
   [[nodiscard]] TallyConnectionOptions options() const {
     return {.socketPath = _path, .firstPause = milliseconds(1), .maximumPause = milliseconds(20)};
   }
